@@ -1,0 +1,167 @@
+// Void and the Booleans: their objects, factories, handles, shared defaults and the mutation
+// between the two Boolean kinds.
+#include "source/TDSimpleTypes.h"
+
+#include <cstring>
+
+#include "runtime/PXStrings.h"
+#include "source/TDAttributes.h"
+#include "source/TypeManager.h"
+#include "vellum/TDVisitor.h"
+
+namespace {
+
+template <class Imp>
+TDImpPtr MakeNamed(const uint8_t* name) {
+  TDNameImpPtr label;
+  if (name != nullptr && name[0] != 0) {
+    label = TDNameImp::Make(name, std::strlen(reinterpret_cast<const char*>(name)));
+    if (!label) return TDImpPtr();
+  }
+  return MakeCounted<Imp>(label, TDTypedefImpPtr());
+}
+
+template <class Imp>
+class SimpleFactory final : public TDTypeFactory {
+ public:
+  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
+    TDImpPtr type = MakeCounted<Imp>();
+    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
+    return type;
+  }
+};
+
+SimpleFactory<TDVoidImp> gVoidFactory;
+SimpleFactory<TDBooleanImp> gBooleanFactory;
+SimpleFactory<TDBooleanU16Imp> gBooleanU16Factory;
+
+// Announced as the library loads; the service registers them in this order at start.
+const bool gAnnounced = [] {
+  AnnounceTypeFactory(38, static_cast<uint16_t>(TypeCode::Boolean), &gBooleanFactory);
+  AnnounceTypeFactory(39, static_cast<uint16_t>(TypeCode::BooleanU16), &gBooleanU16Factory);
+  AnnounceTypeFactory(40, static_cast<uint16_t>(TypeCode::Void), &gVoidFactory);
+  RegisterDefaultTypeGetter(static_cast<int32_t>(TypeCode::Void), &GetVoidTD);
+  RegisterDefaultTypeGetter(static_cast<int32_t>(TypeCode::Boolean), &GetBoolTD);
+  return true;
+}();
+
+int32_t CopyBytes(const void* src, void* dst, int32_t count, int32_t size) {
+  if (src == nullptr || dst == nullptr) return kStatusBadArgument;
+  MoveBlock(src, dst, static_cast<size_t>(size) * static_cast<size_t>(count < 1 ? 1 : count));
+  return kStatusNoError;
+}
+
+// Replaces *self by a fresh object of kind `Other` carrying only the name.
+template <class Other>
+int32_t MutateTo(TDImpPtr* self) {
+  TDImpPtr other = MakeCounted<Other>((*self)->GetNameImpPtr(), TDTypedefImpPtr());
+  if (!other) return 0;
+  *self = other;
+  return 1;
+}
+
+}  // namespace
+
+TDImpPtr TDVoidImp::NewInstance() const { return MakeCounted<TDVoidImp>(); }
+
+void TDVoidImp::Accept(ITDVisitor* visitor) {
+  TDImpPtr held(this);
+  if (IsReadOnlyTD() != 0) {
+    visitor->VisitVoid(TDRVoid(held, 1));
+  } else {
+    TDWVoid writable(held, 1);
+    visitor->VisitVoid(writable);
+  }
+}
+
+TDImpPtr TDBooleanImp::NewInstance() const { return MakeCounted<TDBooleanImp>(); }
+
+int32_t TDBooleanImp::CopyData(const void* src, void* dst, int32_t count, const KoContext*) const {
+  return CopyBytes(src, dst, count, 1);
+}
+
+int32_t TDBooleanImp::MutateBooleanTD(TDImpPtr* self, int32_t toOld) {
+  return toOld != 0 ? MutateTo<TDBooleanU16Imp>(self) : 0;
+}
+
+void TDBooleanImp::Accept(ITDVisitor* visitor) {
+  TDImpPtr held(this);
+  if (IsReadOnlyTD() != 0) {
+    visitor->VisitBoolean(TDRBoolean(held, 1));
+  } else {
+    TDWBoolean writable(held, 1);
+    visitor->VisitBoolean(writable);
+  }
+}
+
+TDImpPtr TDBooleanU16Imp::NewInstance() const { return MakeCounted<TDBooleanU16Imp>(); }
+
+int32_t TDBooleanU16Imp::CopyData(const void* src, void* dst, int32_t count, const KoContext*) const {
+  return CopyBytes(src, dst, count, 2);
+}
+
+int32_t TDBooleanU16Imp::MutateBooleanTD(TDImpPtr* self, int32_t toOld) {
+  return toOld == 0 ? MutateTo<TDBooleanImp>(self) : 0;
+}
+
+void TDBooleanU16Imp::Accept(ITDVisitor* visitor) {
+  TDImpPtr held(this);
+  if (IsReadOnlyTD() != 0) {
+    visitor->VisitBooleanU16(TDRBooleanU16(held, 1));
+  } else {
+    TDWBooleanU16 writable(held, 1);
+    visitor->VisitBooleanU16(writable);
+  }
+}
+
+bool VoidKind::Admit(const TDImp& type) { return type.IsVoid() != 0; }
+TDImpPtr VoidKind::New(const uint8_t* name) { return MakeNamed<TDVoidImp>(name); }
+bool BooleanKind::Admit(const TDImp& type) { return type.IsBool() != 0; }
+TDImpPtr BooleanKind::New(const uint8_t* name) { return MakeNamed<TDBooleanImp>(name); }
+bool BooleanU16Kind::Admit(const TDImp& type) { return type.IsBoolU16() != 0; }
+TDImpPtr BooleanU16Kind::New(const uint8_t* name) { return MakeNamed<TDBooleanU16Imp>(name); }
+
+int32_t TDWBoolean::SetEventDiscardMask(int32_t mask) {
+  if (!imp_) return kStatusNullHandle;
+  imp_->ClearHashValid();
+  if (mask != 0) {
+    imp_->SetFlagBits(kTDFlagEventDiscard);
+  } else {
+    imp_->ClearFlagBits(kTDFlagEventDiscard);
+  }
+  return kStatusNoError;
+}
+
+const TDR& GetVoidTD() {
+  static GlobalTypeEntry entry;
+  return SharedGlobalType(entry, [] { return MakeCounted<TDVoidImp>().StaticCast<TDImp>(); });
+}
+
+const TDR& GetBoolTD() {
+  static GlobalTypeEntry entry;
+  return SharedGlobalType(entry, [] { return MakeCounted<TDBooleanImp>().StaticCast<TDImp>(); });
+}
+
+int32_t MutateBooleanTD(TDImpPtr* type, int32_t toOld) {
+  if (type == nullptr || !*type) return 0;
+  if ((*type)->IsReadOnlyTD() != 0) {
+    DebugReport(__FILE__, __LINE__, 3, "What are you doing?  This TDImpPtr is readonly!");
+    return 0;
+  }
+  return (*type)->MutateBooleanTD(type, toOld);
+}
+
+int32_t MutateBooleanTD(TDW* type, int32_t toOld) {
+  if (type == nullptr || !*type) return 0;
+  TDImpPtr imp = type->GetImpPtr();
+  const int32_t mutated = MutateBooleanTD(&imp, toOld);
+  if (mutated != 0) *type = TDW(imp, 1);
+  return mutated;
+}
+
+void ITDVisitor::VisitVoid(const TDRVoid& type) { Visit(static_cast<const TDR&>(type)); }
+void ITDVisitor::VisitVoid(TDWVoid& type) { Visit(static_cast<TDW&>(type)); }
+void ITDVisitor::VisitBoolean(const TDRBoolean& type) { Visit(static_cast<const TDR&>(type)); }
+void ITDVisitor::VisitBoolean(TDWBoolean& type) { Visit(static_cast<TDW&>(type)); }
+void ITDVisitor::VisitBooleanU16(const TDRBooleanU16& type) { Visit(static_cast<const TDR&>(type)); }
+void ITDVisitor::VisitBooleanU16(TDWBooleanU16& type) { Visit(static_cast<TDW&>(type)); }

@@ -1,0 +1,71 @@
+// Helpers shared by every test file: capturing diagnostic lines and checking that a test
+// leaves no handle or block allocated.
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <algorithm>
+#include <cstdint>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "runtime/DSMemory.h"
+#include "runtime/DebugStream.h"
+
+// Collects every DebugMessage emitted while it lives (from any thread), instead of printing
+// them; restores the default sink when destroyed.
+class DebugCapture {
+ public:
+  DebugCapture() : state_(std::make_shared<State>()) {
+    std::shared_ptr<State> state = state_;
+    SetDebugSink([state](const DebugMessage& m) {
+      std::lock_guard lock(state->mutex);
+      state->messages.push_back(m);
+    });
+  }
+  ~DebugCapture() { SetDebugSink(DebugSink()); }
+  DebugCapture(const DebugCapture&) = delete;
+  DebugCapture& operator=(const DebugCapture&) = delete;
+
+  std::vector<DebugMessage> Messages() const {
+    std::lock_guard lock(state_->mutex);
+    return state_->messages;
+  }
+  std::vector<std::string> Texts() const {
+    std::vector<std::string> texts;
+    for (const DebugMessage& m : Messages()) texts.push_back(m.text);
+    return texts;
+  }
+  // True when some message's text contains `text`.
+  bool Contains(std::string_view text) const {
+    const std::vector<std::string> texts = Texts();
+    return std::any_of(texts.begin(), texts.end(),
+                       [&](const std::string& t) { return t.find(text) != std::string::npos; });
+  }
+  void Clear() {
+    std::lock_guard lock(state_->mutex);
+    state_->messages.clear();
+  }
+
+ private:
+  struct State {
+    std::mutex mutex;  // guards messages
+    std::vector<DebugMessage> messages;
+  };
+  std::shared_ptr<State> state_;
+};
+
+// Records the live block count when built and expects the same count when destroyed.
+class LiveBlockCheck {
+ public:
+  LiveBlockCheck() : before_(DSLiveBlockCount()) {}
+  ~LiveBlockCheck() { EXPECT_EQ(DSLiveBlockCount(), before_) << "handles or blocks leaked"; }
+  LiveBlockCheck(const LiveBlockCheck&) = delete;
+  LiveBlockCheck& operator=(const LiveBlockCheck&) = delete;
+
+ private:
+  int64_t before_;
+};
