@@ -225,8 +225,19 @@ int32_t BinDataReader::Take(void* dst, size_t n) {
   return status_;
 }
 
-int32_t BinDataReader::ReadI8(int8_t* v) { return Take(v, sizeof *v); }
-int32_t BinDataReader::ReadU8(uint8_t* v) { return Take(v, sizeof *v); }
+int32_t BinDataReader::ReadU8(uint8_t* v) {
+  uint8_t s = 0;
+  Take(&s, sizeof s);
+  if (v) *v = s;
+  return status_;
+}
+
+int32_t BinDataReader::ReadI8(int8_t* v) {
+  uint8_t u = 0;
+  ReadU8(&u);
+  if (v) *v = static_cast<int8_t>(u);
+  return status_;
+}
 
 int32_t BinDataReader::ReadI16(int16_t* v) {
   uint16_t u = 0;
@@ -285,6 +296,7 @@ int32_t BinDataReader::ReadF64(double* v) {
 }
 
 int32_t BinDataReader::ReadPStr(uint8_t* buf256) {
+  if (status_ == 0 && !buf256) SetError(kStatusBadArgument);
   uint8_t n = 0;
   if (ReadU8(&n) == 0) Take(buf256 ? buf256 + 1 : nullptr, n);
   if (buf256) buf256[0] = status_ == 0 ? n : 0;

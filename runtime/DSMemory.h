@@ -19,8 +19,8 @@
 int32_t DSNewHandle(size_t size, UHandle* out);
 // Same, with the block zeroed.
 int32_t DSNewHClr(size_t size, UHandle* out);
-// Zeroed block whose address is a multiple of `alignment` (a power of two; 1 for other values),
-// also after resizing.
+// Zeroed block whose address is a multiple of `alignment`, also after resizing. `alignment` is a
+// power of two; any other value gets the default alignment of std::max_align_t.
 int32_t DSNewAlignedHClr(size_t size, size_t alignment, UHandle* out);
 // Keeps the first min(old, new) bytes. 42 for a null handle, 1 for a non-live one, 2 when
 // memory runs out (the handle is then unchanged).

@@ -171,6 +171,10 @@ OMIdDictionary& TheOMIdDictionary() {
 
 void RegisterDictionary(ITDDictionary* dictionary) {
   const int32_t count = gNumDictionaries.load(std::memory_order_acquire);
+  // A start without a stop registers the same dictionaries again; each is collected once.
+  for (int32_t i = 0; i < count; ++i) {
+    if (gDictionaries[i] == dictionary) return;
+  }
   if (count >= kMaxDictionaries) {
     DebugReport(__FILE__, __LINE__, 4, "Too many dictionaries registered");
     return;
@@ -279,13 +283,15 @@ void GarbageCollectDictionaries() {
   if (LoggingEnabled()) {
     const uint64_t firstTotal = passes.front().second;
     const uint64_t lastTotal = passes.back().second;
+    // Other threads may check in while this runs, so the dictionaries can end up larger.
+    const int64_t freed = static_cast<int64_t>(firstTotal) - static_cast<int64_t>(lastTotal);
     std::ostringstream line;
     line << "TypeGC[" << number << "] " << LocalTimestamp() << " {Flat:" << Number(flatMs) << "ms, "
          << Percent(flatRemoved, flatVisited) << "%(" << flatRemoved << "/" << flatVisited << ")}"
          << " {Dicts:" << Number(dictMs) << "ms, " << firstTotal << "[";
     for (size_t i = 0; i < passes.size(); ++i) line << (i == 0 ? "" : ",") << passes[i].first;
-    line << "]" << lastTotal << ", " << Percent(static_cast<double>(firstTotal - lastTotal), static_cast<double>(firstTotal))
-         << "%(" << firstTotal - lastTotal << "/" << firstTotal << ")}";
+    line << "]" << lastTotal << ", " << Percent(static_cast<double>(freed), static_cast<double>(firstTotal)) << "%("
+         << freed << "/" << firstTotal << ")}";
     DebugReport(__FILE__, __LINE__, 1, line.str());
   }
   if (GarbageCollectingListener listener = gListener.load(std::memory_order_acquire)) listener(false);

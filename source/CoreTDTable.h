@@ -28,7 +28,7 @@ class ITDDictionary {
 };
 
 // Holds interned objects keyed by their hash; equal objects (`InternEqual`, which must be
-// visible where Find or Insert is used) are kept once. Each dictionary has its own mutex, held
+// visible where Find or Insert is used, as must `MarkInterned`) are kept once. Each dictionary has its own mutex, held
 // for the whole of every operation; while it is held only the objects' hash and equality run.
 template <class Ptr, class Imp>
 class Dictionary : public ITDDictionary {
@@ -71,10 +71,16 @@ class Dictionary : public ITDDictionary {
     } catch (const std::bad_alloc&) {
       return kStatusOutOfMemory;
     }
+    MarkInterned(*object);
     return kStatusNoError;
   }
 
-  uint32_t Size() const override { return table_ ? static_cast<uint32_t>(table_->size()) : 0; }
+  // Under the lock: a check-in on another thread may be growing the table meanwhile.
+  uint32_t Size() const override {
+    if (!table_) return 0;
+    ThMutexLock lock(mutex_);
+    return static_cast<uint32_t>(table_->size());
+  }
 
   void Purge() override {
     if (!table_) return;
@@ -90,10 +96,15 @@ class Dictionary : public ITDDictionary {
 
   const char* Name() const override { return name_; }
 
+  // Gives back the bucket array too (a fresh table allocates nothing until its first insertion),
+  // so a stopped library holds no memory in its dictionaries.
   void Empty() override {
     if (!table_) return;
-    ThMutexLock lock(mutex_);
-    table_->clear();
+    Table doomed;
+    {
+      ThMutexLock lock(mutex_);
+      table_->swap(doomed);
+    }
   }
 
   // Calls `fn(Ptr&)` on every entry while holding the lock (the collection's marking walk).

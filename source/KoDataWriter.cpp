@@ -35,8 +35,11 @@ bool KoDataWriter::IsOnlyDeterminingSize() const {
 int32_t KoDataWriter::WriteVariableSizeField(int32_t value) {
   if (GetError() != kStatusNoError) return GetError();
   if (value < 0) {
+    // A negative value has no form that reads back: its low 16 bits would be taken as the start
+    // of a 32-bit field and the rest of the stream misread. Refuse it instead of writing it.
     (VELLUM_DEBUG(3) << "Exceeded limits of TDDataWriter::WriteVariableSizeField").Process();
-    return WriteU16(static_cast<uint16_t>(value & 0xFFFF));
+    SetError(kStatusBadArgument);
+    return GetError();
   }
   if (value <= kLargestShortSizeField) return WriteU16(static_cast<uint16_t>(value));
   return WriteU32(static_cast<uint32_t>(value) | 0x80000000u);

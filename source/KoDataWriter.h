@@ -10,8 +10,8 @@
 // Options of one save or load. The bits are the ones a context keeps for consolidated types.
 using PersistTDDataOptions = uint32_t;
 constexpr PersistTDDataOptions kPersistDropSharedList = 0x1;         // keep no shared type list
-constexpr PersistTDDataOptions kPersistDeferIndices = 0x2;           // consolidated references are queued
-constexpr PersistTDDataOptions kPersistSuppressConsolidation = 0x4;  // never use consolidated types
+constexpr PersistTDDataOptions kPersistDeferIndices = 0x2;           // queue consolidated references
+constexpr PersistTDDataOptions kPersistSuppressConsolidation = 0x4;  // no consolidated types
 
 // The context of one save or load of descriptors and data: the version word being written or
 // read, the application context the descriptors belong to, and options. A small value; copies

@@ -43,7 +43,8 @@ bool IsSaneComponent(std::string_view component) {
 }
 
 std::string_view AsView(const uint8_t* bytes, size_t length) {
-  return length == 0 ? std::string_view() : std::string_view(reinterpret_cast<const char*>(bytes), length);
+  if (length == 0) return std::string_view();
+  return std::string_view(reinterpret_cast<const char*>(bytes), length);
 }
 
 // Orders two names by `rule` over the common components, then by count.

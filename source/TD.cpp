@@ -164,18 +164,25 @@ int32_t TDImp::WriteData(KoDataWriter*, const void*, int32_t, int32_t* status) c
   return kStatusNullHandle;
 }
 
-int32_t TDImp::CopyData(const void* src, void* dst, int32_t count, const KoContext*) const {
+int32_t TDImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {
+  // The int32 is the copy's flags, never a count: one datum is copied.
   const int32_t code = GetTypeCode();
   if (code < 1 || code > 30) {
     (VELLUM_DEBUG(3) << "CopyData bad type=").AppendHex32(static_cast<uint32_t>(code)).Process();
     return kStatusBadArgument;
   }
   if (src == nullptr || dst == nullptr) return kStatusBadArgument;
-  MoveBlock(src, dst, static_cast<size_t>(NumSize(code)) * static_cast<size_t>(count < 1 ? 1 : count));
+  MoveBlock(src, dst, static_cast<size_t>(NumSize(code)));
   return kStatusNoError;
 }
 
-int32_t TDImp::CopyDataConvertCore(const TDImp*, const void*, void*, int32_t) const {
+int32_t TDImp::CopyDataConvertCore(const TDImp* dst, const void*, void*, int32_t) const {
+  // A family without conversions refuses rather than report an untouched destination as done.
+  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
+      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
+      .Append(", tcSrc=")
+      .AppendHex32(static_cast<uint32_t>(GetTypeCode()))
+      .Process();
   return kStatusBadArgument;
 }
 

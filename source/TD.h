@@ -49,11 +49,19 @@ constexpr int32_t kCmpFlagCompareNamesDeep = 0x2;
 constexpr int32_t kCmpFlagTypedefIncompatible = 0x4;
 constexpr int32_t kCmpFlagIgnoreTypedefs = 0x8;
 constexpr int32_t kCmpFlagCompareFlagWords = 0x40;
+// Numbers: a refnum cookie may go into a UInt32 or UInt64, an enumeration into a plain number.
+constexpr int32_t kCmpFlagLooseNumbers = 0x100;
 constexpr int32_t kCmpFlagTypedefBit = 0x400;
 constexpr int32_t kCmpFlagReportLoss = 0x2000;
+// Numbers: units may be dropped or added where one side has none.
+constexpr int32_t kCmpFlagIgnoreMissingUnits = 0x4000;
 constexpr int32_t kCmpFlagIgnoreTimeStamps = 0x8000;
 constexpr int32_t kCmpFlagDropLinksIfAny = 0x40000;
+// Numbers: destination units with a polymorphic unit accept any units.
+constexpr int32_t kCmpFlagPolyUnitsMatchAny = 0x80000;
 constexpr int32_t kCmpFlagSecondPass = 0x100000;
+// Numbers: an enumeration may go into a plain number.
+constexpr int32_t kCmpFlagEnumIntoPlain = 0x800000;
 constexpr int32_t kCmpFlagGenericMatters = 0x8000000;
 constexpr int32_t kCmpFlagEphemeralMatters = 0x10000000;
 
@@ -101,7 +109,7 @@ class TDImp : public TDRefCountedHashedObj {
   virtual int32_t IsFlatDataFixedSize() const { return 0; }
   virtual int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const;
   virtual int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const;
-  virtual int32_t CopyData(const void* src, void* dst, int32_t count, const KoContext* context) const;
+  virtual int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const;
   virtual bool CopyDataConvertDestOverride(const TDImp*, const void*, void*, int32_t, int32_t&) const {
     return false;
   }
@@ -167,6 +175,8 @@ class TDImp : public TDRefCountedHashedObj {
 
 // What the descriptor dictionary calls to match interned descriptors.
 inline bool InternEqual(const TDImp& a, const TDImp& b) { return a.IsSameAs(b) != 0; }
+// Descriptors carry their own read-only flag, set by check-in before insertion.
+inline void MarkInterned(TDImp&) {}
 
 // A read-only handle on an interned descriptor; for code that has the object in hand.
 inline TDR TDRFromImp(const TDImpPtr& imp) { return TDR(imp, 1); }

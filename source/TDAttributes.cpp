@@ -306,7 +306,7 @@ TDWName::TDWName(const uint8_t* cString) {
 }
 
 TDWName::TDWName(const TDNameImpPtr& p, int32_t take) {
-  if (take != 0 && p) imp_ = p;
+  if (take != 0 && p && !p->IsInterned()) imp_ = p;
 }
 
 TDNameImpPtr TDWName::GetNameImpPtr() const { return IsName(imp_) ? As<TDNameImp>(imp_) : TDNameImpPtr(); }
@@ -370,7 +370,7 @@ TDWTypedef::TDWTypedef(const QualifiedName& viName, uint32_t timeStamp, Path viP
 }
 
 TDWTypedef::TDWTypedef(const TDTypedefImpPtr& p, int32_t take) {
-  if (take != 0 && p) imp_ = p;
+  if (take != 0 && p && !p->IsInterned()) imp_ = p;
 }
 
 TDTypedefImpPtr TDWTypedef::GetTypedefImpPtr() const {

@@ -2,6 +2,7 @@
 // here; units and enumerations derive from the same base in their own modules.
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <string>
 
@@ -30,8 +31,16 @@ class TDAttributeImp : public TDRefCountedHashedObj {
   virtual int32_t IsEnumAttribute() const { return 0; }
   virtual int32_t IsUnitsAttribute() const { return 0; }
 
+  // Set when the object enters its dictionary: from then on it is shared by every descriptor that
+  // uses it, so no writable handle may hold it and no setter may touch it.
+  bool IsInterned() const noexcept { return interned_.load(std::memory_order_acquire); }
+  void MarkInterned() noexcept { interned_.store(true, std::memory_order_release); }
+
  protected:
   TDAttributeImp() noexcept = default;
+
+ private:
+  std::atomic<bool> interned_{false};
 };
 
 // A descriptor's label: at most 255 bytes, or no text at all.
@@ -107,3 +116,4 @@ class TDTypedefImp final : public TDAttributeImp {
 
 // What the dictionaries call to match interned attributes.
 inline bool InternEqual(const TDAttributeImp& a, const TDAttributeImp& b) { return a.IsEqual(b) != 0; }
+inline void MarkInterned(TDAttributeImp& attribute) { attribute.MarkInterned(); }

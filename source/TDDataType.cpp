@@ -203,6 +203,7 @@ int32_t TD::ContainsVariantAsData() const {
 }
 
 int32_t TD::TypedefsPathized() const {
+  if (!imp_) return 0;
   const bool unpathized = Contains(imp_, [](const TDImp& t) {
     const TDTypedefImpPtr& link = t.GetTypedefImpPtr();
     return link && !link->IsPathized();
@@ -272,7 +273,7 @@ int32_t TDW::SetName(const std::string& name) {
     return kStatusNoError;
   }
   const auto* bytes = reinterpret_cast<const uint8_t*>(name.data());
-  if (const TDNameImpPtr& existing = imp_->GetNameImpPtr()) {
+  if (const TDNameImpPtr& existing = imp_->GetNameImpPtr(); existing && !existing->IsInterned()) {
     const int32_t status = existing->SetText(bytes, name.size());
     imp_->ClearHashValid();
     return status;

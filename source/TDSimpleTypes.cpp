@@ -45,10 +45,22 @@ const bool gAnnounced = [] {
   return true;
 }();
 
-int32_t CopyBytes(const void* src, void* dst, int32_t count, int32_t size) {
+int32_t CopyBytes(const void* src, void* dst, int32_t size) {
   if (src == nullptr || dst == nullptr) return kStatusBadArgument;
-  MoveBlock(src, dst, static_cast<size_t>(size) * static_cast<size_t>(count < 1 ? 1 : count));
+  MoveBlock(src, dst, static_cast<size_t>(size));
   return kStatusNoError;
+}
+
+// A Boolean converts only into its own kind; the width change between the two kinds belongs to
+// MutateBooleanTD.
+int32_t ConvertBoolean(const TDImp& self, const TDImp* dst, const void* src, void* dstData, int32_t size) {
+  if (dst != nullptr && dst->GetTypeCode() == self.GetTypeCode()) return CopyBytes(src, dstData, size);
+  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
+      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
+      .Append(", tcSrc=")
+      .AppendHex32(static_cast<uint32_t>(self.GetTypeCode()))
+      .Process();
+  return kStatusBadArgument;
 }
 
 // Replaces *self by a fresh object of kind `Other` carrying only the name.
@@ -76,8 +88,12 @@ void TDVoidImp::Accept(ITDVisitor* visitor) {
 
 TDImpPtr TDBooleanImp::NewInstance() const { return MakeCounted<TDBooleanImp>(); }
 
-int32_t TDBooleanImp::CopyData(const void* src, void* dst, int32_t count, const KoContext*) const {
-  return CopyBytes(src, dst, count, 1);
+int32_t TDBooleanImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {
+  return CopyBytes(src, dst, 1);
+}
+
+int32_t TDBooleanImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t) const {
+  return ConvertBoolean(*this, dst, src, dstData, 1);
 }
 
 int32_t TDBooleanImp::MutateBooleanTD(TDImpPtr* self, int32_t toOld) {
@@ -96,8 +112,12 @@ void TDBooleanImp::Accept(ITDVisitor* visitor) {
 
 TDImpPtr TDBooleanU16Imp::NewInstance() const { return MakeCounted<TDBooleanU16Imp>(); }
 
-int32_t TDBooleanU16Imp::CopyData(const void* src, void* dst, int32_t count, const KoContext*) const {
-  return CopyBytes(src, dst, count, 2);
+int32_t TDBooleanU16Imp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {
+  return CopyBytes(src, dst, 2);
+}
+
+int32_t TDBooleanU16Imp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t) const {
+  return ConvertBoolean(*this, dst, src, dstData, 2);
 }
 
 int32_t TDBooleanU16Imp::MutateBooleanTD(TDImpPtr* self, int32_t toOld) {

@@ -25,7 +25,8 @@ class TDBooleanImp final : public TDImp {
   int16_t GetTypeCode() const override { return static_cast<int16_t>(TypeCode::Boolean); }
   TDImpPtr NewInstance() const override;
   int32_t DataSizeCore(ITargetPlatformAlignment*) const override { return 1; }
-  int32_t CopyData(const void* src, void* dst, int32_t count, const KoContext* context) const override;
+  int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;
+  int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
   int32_t MutateBooleanTD(TDImpPtr* self, int32_t toOld) override;
   void Accept(ITDVisitor* visitor) override;
   int32_t IsBool() const override { return 1; }
@@ -39,7 +40,8 @@ class TDBooleanU16Imp final : public TDImp {
   int16_t GetTypeCode() const override { return static_cast<int16_t>(TypeCode::BooleanU16); }
   TDImpPtr NewInstance() const override;
   int32_t DataSizeCore(ITargetPlatformAlignment*) const override { return 2; }
-  int32_t CopyData(const void* src, void* dst, int32_t count, const KoContext* context) const override;
+  int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;
+  int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
   int32_t MutateBooleanTD(TDImpPtr* self, int32_t toOld) override;
   void Accept(ITDVisitor* visitor) override;
   int32_t IsBoolU16() const override { return 1; }

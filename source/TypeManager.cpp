@@ -6,6 +6,7 @@
 #include <mutex>
 #include <vector>
 
+#include "FixedPoint/fxp.h"
 #include "runtime/DebugStream.h"
 #include "runtime/PXMutex.h"
 #include "source/CoreTDTable.h"
@@ -77,6 +78,14 @@ void ReleaseRegisteredTypes() {
   gRegisteredCount = 0;
 }
 
+// Fixed-point arithmetic has no diagnostics of its own; its failed checks come here.
+void ReportFixedPointAssertion(const char* file, uint32_t line, const char* condition, const char* message) {
+  (VELLUM_DEBUG(2) << "FXP assertion failed in: " << (file != nullptr ? file : "") << ":" << line
+                   << ".  Failed assertion was " << (condition != nullptr ? condition : "") << " with message \""
+                   << (message != nullptr ? message : "") << "\"")
+      .Process();
+}
+
 class TypeManager_Service final : public IServiceObject {
  public:
   int32_t Start() override {
@@ -94,10 +103,12 @@ class TypeManager_Service final : public IServiceObject {
       const int32_t status = ThMutexCreate(&gRegisterMutex, "RegisterMutex");
       if (status != kStatusNoError) return status;
     }
+    vellum::FXP::registerAssertFunction(&ReportFixedPointAssertion);
     return kStatusNoError;
   }
 
   int32_t Stop() override {
+    vellum::FXP::registerAssertFunction(nullptr);
     ReleaseRegisteredTypes();
     ThMutexDestroy(&gRegisterMutex);
     GarbageCollectDictionaries();

@@ -18,7 +18,8 @@ const uint8_t* Bytes(const char* text) { return reinterpret_cast<const uint8_t*>
 
 std::string Contents(const IQXStr& s) {
   if (s.GetSize() == 0) return std::string();
-  return std::string(reinterpret_cast<const char*>(s.GetReadPtr()), static_cast<size_t>(s.GetSize()));
+  return std::string(reinterpret_cast<const char*>(s.GetReadPtr()),
+                     static_cast<size_t>(s.GetSize()));
 }
 
 LStrHandle MakeLStr(std::string_view text) {

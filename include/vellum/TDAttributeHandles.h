@@ -55,6 +55,7 @@ class TDWName : public TDAttribute {
   TDWName() noexcept = default;
   // A new, private name object with that text (at most 255 bytes kept).
   explicit TDWName(const uint8_t* cString);
+  // Holds `p` when `take` is nonzero and `p` is a private object; an interned one is refused.
   TDWName(const TDNameImpPtr& p, int32_t take);
 
   TDNameImpPtr GetNameImpPtr() const;
@@ -91,6 +92,7 @@ class TDWTypedef : public TDAttribute {
   TDWTypedef() noexcept = default;
   // A new, private typedef link. The path is copied (null for none).
   TDWTypedef(const QualifiedName& viName, uint32_t timeStamp, Path viPath);
+  // Holds `p` when `take` is nonzero and `p` is a private object; an interned one is refused.
   TDWTypedef(const TDTypedefImpPtr& p, int32_t take);
 
   TDTypedefImpPtr GetTypedefImpPtr() const;

@@ -6,6 +6,7 @@
 #include <string>
 #include <type_traits>
 
+#include "vellum/TDLayout.h"
 #include "vellum/TDPredicates.h"
 #include "vellum/TypeCodes.h"
 
@@ -19,6 +20,7 @@ class TDUnitsImp;
 class TDEnumImp;
 class TDOMIdImp;
 class ITDVisitor;
+class HandleAllocationInterface;
 
 // Owning pointer to a counted object. Copying takes a reference; `Free` drops it and destroys the
 // object when it was the last one. Counts change atomically, so pointers to one shared object may
@@ -161,6 +163,32 @@ class TD {
   int32_t ContainsVariantAsData() const;
   int32_t TypedefsPathized() const;
 
+  // Data layout and the life cycle of data of this type. `platform` null means the running
+  // process (pointer size 8, largest alignment as set by SetDSAlign). A null handle answers 0 for
+  // sizes, alignments, shapes and released bytes; AlignDatum then returns the offset unchanged.
+  int32_t DataSize(ITargetPlatformAlignment* platform = nullptr) const;
+  int32_t GetAlignment(ITargetPlatformAlignment* platform = nullptr) const;
+  // `offset` (or an absolute address) rounded up to where a datum of this type may start.
+  int64_t AlignDatum(int64_t offset, ITargetPlatformAlignment* platform = nullptr) const;
+  DataShapes DataShape() const;
+  DataShapes FlatDataShape() const;
+  // Writes the default value into uninitialised (onlyIfEmpty 0) or empty memory. 1 for a null
+  // handle or null data; 2 when memory runs out.
+  int32_t InflateDefData(void* data, int32_t onlyIfEmpty, int32_t clearFirst, int32_t flags) const;
+  // Turns a valid value into the default, reusing its memory. 1 for null data, 42 for a null handle.
+  int32_t ResetToDefaultData(void* data) const;
+  // Give handle memory back through `allocator`; only data below `end` is touched. The result is
+  // the number of bytes released.
+  int32_t DeflateData(void* data, void* end, int32_t dispose, const HandleAllocationInterface& allocator) const;
+  int32_t ShrinkData(void* data, void* end, int32_t flag, const HandleAllocationInterface& allocator) const;
+  // 0 when the datum's handles are sound; damage goes to the rave procedure (SetTDRaveProc) and
+  // the debug stream. 0x100000 for a null handle.
+  int32_t VerifyData(const void* data, const KoContext* context) const;
+  // A deep copy into storage of the same type. 1 when either pointer is null, 42 for a null handle.
+  int32_t CopyData(const void* src, void* dst, const KoContext* context, int32_t flags) const;
+  // Whether every value of this type survives conversion into `other`; false when either is null.
+  bool ConversionIsLossless(const TD& other) const;
+
  protected:
   TDImpPtr imp_;
 };
@@ -189,6 +217,10 @@ class TDR : public TD {
   using ShouldRecurseTDR = bool (*)(const TDR&);
   // Pre-order walk, elements in order; nothing is replaced. A null `shouldRecurse` always descends.
   TDTraverseValue TraverseTDR(VisitTDR visit, void* context, ShouldRecurseTDR shouldRecurse) const;
+
+  // Copies a value of this type into storage of type `dst`, converting it. 1 when either data
+  // pointer is null, 42 when either handle is null; otherwise the families' status.
+  int32_t CopyDataConvert(const TD& dst, const void* src, void* dstData, int32_t flags) const;
 };
 
 // A writable handle: null, or a private, mutable descriptor that is not interned. It can never
@@ -232,6 +264,9 @@ class TDW : public TD {
   // *replaced, the object its `TDW` then holds replaces the visited one in its container, or, at
   // the top, becomes this handle's object.
   TDTraverseValue TraverseTDW(VisitTDW visit, void* context, ShouldRecurseTDW shouldRecurse);
+
+  // As TDR::CopyDataConvert.
+  int32_t CopyDataConvert(const TD& dst, const void* src, void* dstData, int32_t flags) const;
 };
 
 // Handles that always hold null.
@@ -255,6 +290,10 @@ TDR MakeTDRFromTDImp(const TDImp* imp);
 const TDR& MakeDefaultTDRForTypeCode(int32_t code);
 // The default checked out, or a null `TDW` when there is none.
 TDW MakeDefaultTDWForTypeCode(int32_t code);
+
+// Zeroes the in-place bytes of one datum of `type` when `clear` is nonzero (nothing for a null
+// handle or null data). Handles inside the datum are not disposed.
+void TDImpClearMemory(void* data, const TD& type, int32_t clear);
 
 // The short type text: "null" for a null handle, otherwise the kind's text.
 std::string ToString(const TDR& type);
