@@ -16,7 +16,6 @@
 #include "runtime/PXStrings.h"
 #include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
-#include "source/TDDataManager.h"
 #include "source/TypeManager.h"
 
 namespace {
@@ -194,7 +193,9 @@ class BasicNumericFactory final : public TDTypeFactory {
     return type;
   }
 
-  TDImpPtr CreateUnflattenHandler(int16_t) const override { return InfoOf(static_cast<int32_t>(kCode)).defaultGetter().GetImpPtr(); }
+  TDImpPtr CreateUnflattenHandler(int16_t) const override {
+    return InfoOf(static_cast<int32_t>(kCode)).defaultGetter().GetImpPtr();
+  }
 
  private:
   // An empty descriptor; with a reader, the members the code announces and the flag byte are

@@ -4,6 +4,8 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdlib>
+
 #include <new>
 #include <stdexcept>
 #include <string>
@@ -116,7 +118,9 @@ void Destroy(void* object) {
   if (id == 1) RegisterPlacementDelete(&Destroy, &late);
 }
 
-TEST(PXServicesTest, PlacementDeletesRunNewestFirstOnce) {
+// Running the placement deletes is the host's shutdown: it destroys the library's own statics
+// too, so the test runs it in a child process and keeps this one usable.
+bool PlacementDeletesBehave() {
   RunPlacementDeletes();  // whatever earlier code registered
   std::vector<int> destroyed;
   gDestroyed = &destroyed;
@@ -127,15 +131,21 @@ TEST(PXServicesTest, PlacementDeletesRunNewestFirstOnce) {
   RegisterPlacementDelete(&Destroy, &two);
   RegisterPlacementDelete(&Destroy, &three);
   RegisterPlacementDelete(nullptr, &three);
-  EXPECT_EQ(PendingPlacementDeletes(), 3);
+  bool ok = PendingPlacementDeletes() == 3;
   RunPlacementDeletes();
-  EXPECT_EQ(destroyed, (std::vector<int>{3, 2, 1, 99}));
+  ok = ok && destroyed == std::vector<int>{3, 2, 1, 99};
   RunPlacementDeletes();
-  EXPECT_EQ(destroyed.size(), 4u) << "each runs once";
+  ok = ok && destroyed.size() == 4u;  // each runs once
   RegisterPlacementDelete(&Destroy, &two);
   RunPlacementDeletes();
-  EXPECT_EQ(destroyed.back(), 2) << "registrations after a run still work";
+  ok = ok && destroyed.back() == 2;  // registrations after a run still work
   gDestroyed = nullptr;
+  return ok;
+}
+
+TEST(PXServicesTest, PlacementDeletesRunNewestFirstOnce) {
+  GTEST_FLAG_SET(death_test_style, "threadsafe");
+  EXPECT_EXIT(std::exit(PlacementDeletesBehave() ? 0 : 1), ::testing::ExitedWithCode(0), "");
 }
 
 TEST(PXServicesTest, KoExceptFromStandardExceptions) {

@@ -12,6 +12,7 @@
 
 #include "TestSupport.h"
 #include "TypeSystemFixture.h"
+#include "FixedPoint/fxp.h"
 #include "source/CoreTDTable.h"
 #include "vellum.h"
 
@@ -322,6 +323,28 @@ TEST_F(TypeManagerTest, HookSettersStore) {
   SetDSAlign(1);
   EXPECT_EQ(GetDSAlign(), 1);
   SetDSAlign(alignment);
+}
+
+// Fixed-point arithmetic reports failed checks only while the service runs; they arrive as one
+// level-2 line of the type manager.
+TEST_F(TypeManagerTest, FixedPointAssertionsAreReportedWhileRunning) {
+  DebugCapture capture;
+  const vellum::FXP bad(int64_t{1}, 0, 0);
+  const std::vector<DebugMessage> messages = capture.Messages();
+  ASSERT_FALSE(messages.empty());
+  EXPECT_EQ(messages[0].level, 2);
+  EXPECT_EQ(messages[0].module, "TypeManager");
+  const std::string prefix = "FXP assertion failed in: dep_mirror\\deps\\FixedPoint\\includes\\fxp:";
+  EXPECT_EQ(messages[0].text.substr(0, prefix.size()), prefix);
+  const std::string suffix = ".  Failed assertion was m_wl >= 1 with message \"Wordlenth out of range\"";
+  ASSERT_GE(messages[0].text.size(), suffix.size());
+  EXPECT_EQ(messages[0].text.substr(messages[0].text.size() - suffix.size()), suffix);
+
+  services_.StopAll();
+  capture.Clear();
+  const vellum::FXP unchecked(int64_t{1}, 0, 0);
+  EXPECT_TRUE(capture.Messages().empty()) << "no reporter once the service has stopped";
+  ASSERT_EQ(services_.Start(TypeManagerService()), 0);
 }
 
 }  // namespace
