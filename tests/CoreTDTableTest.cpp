@@ -25,7 +25,6 @@ namespace {
 
 class CoreTDTableTest : public TypeSystemTest {};
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
 constexpr const char* kLoggingKey = "vellum.garbageCollection.logging";
 

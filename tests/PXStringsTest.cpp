@@ -10,7 +10,6 @@
 
 namespace {
 
-const uint8_t* U(const char* s) { return reinterpret_cast<const uint8_t*>(s); }
 
 struct Owned {
   LStrHandle h = nullptr;

@@ -18,7 +18,6 @@ namespace {
 
 class TDAttributesTest : public TypeSystemTest {};
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
 std::string Text(const uint8_t* pString) {
   return std::string(reinterpret_cast<const char*>(pString + 1), pString[0]);

@@ -19,20 +19,7 @@ namespace {
 
 class TDDataTypeTest : public TypeSystemTest {};
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
-TDWTypedef Link(const std::string& viName, uint32_t timeStamp, bool pathized = false) {
-  QualifiedName name;
-  EXPECT_EQ(name.FromDelimitedName(viName), kStatusNoError);
-  Path path = nullptr;
-  if (pathized) {
-    EXPECT_EQ(FEmptyPath(&path), kStatusNoError);
-    EXPECT_EQ(FAppendName(path, U("\x07types.x")), kStatusNoError);
-  }
-  TDWTypedef link(name, timeStamp, path);
-  FDestroyPath(&path);
-  return link;
-}
 
 TDW Linked(TDW type, const TDWTypedef& link) {
   EXPECT_EQ(type.SetTypedef(link), kStatusNoError);

@@ -16,7 +16,6 @@ namespace {
 
 class TDSimpleTypesTest : public TypeSystemTest {};
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
 std::string NameOf(const TD& type) {
   std::string name = "<none>";

@@ -17,21 +17,7 @@ namespace {
 
 class TDTest : public TypeSystemTest {};
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
-// A typedef link to the definition `viName` ("lib:file"), optionally with a path.
-TDWTypedef Link(const std::string& viName, uint32_t timeStamp, bool pathized = false) {
-  QualifiedName name;
-  EXPECT_EQ(name.FromDelimitedName(viName), kStatusNoError);
-  Path path = nullptr;
-  if (pathized) {
-    EXPECT_EQ(FEmptyPath(&path), kStatusNoError);
-    EXPECT_EQ(FAppendName(path, U("\x07types.x")), kStatusNoError);
-  }
-  TDWTypedef link(name, timeStamp, path);
-  FDestroyPath(&path);
-  return link;
-}
 
 TDW Boolean(const char* name = nullptr) { return TDWBoolean(U(name)); }
 

@@ -73,29 +73,6 @@ int32_t UnFlatten(const Bytes& bytes, TDUnitsImp* units, size_t* consumed = null
 
 int32_t Sign(int32_t value) { return (value > 0) - (value < 0); }
 
-// Fails the 1st, 2nd, ... allocation of `operation` until it succeeds; each failure must give
-// `expected` and leave nothing allocated.
-template <class Operation>
-void SweepAllocationFailures(int32_t expected, Operation&& operation) {
-  for (int64_t nth = 1;; ++nth) {
-    SCOPED_TRACE(nth);
-    ASSERT_LT(nth, 100) << "never succeeded";
-    LiveBlockCheck blocks;
-    int32_t status = 0;
-    bool fired = false;
-    {
-      ScopedAllocationFailure failure(nth);
-      status = operation();
-      fired = failure.Fired();
-    }
-    if (!fired) {
-      EXPECT_EQ(status, 0);
-      EXPECT_GT(nth, 1) << "the operation allocated nothing that could fail";
-      return;
-    }
-    EXPECT_EQ(status, expected);
-  }
-}
 
 // ---- keys and setters ----
 

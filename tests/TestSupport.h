@@ -69,3 +69,30 @@ class LiveBlockCheck {
  private:
   int64_t before_;
 };
+
+// Text literals as the byte strings the library's C-string and Pascal-string calls take.
+inline const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
+
+// Fails the 1st, 2nd, ... allocation of `operation` until it succeeds. Each failure must give
+// `expected` and leave nothing allocated; the run that succeeds must give 0.
+template <class Operation>
+void SweepAllocationFailures(int32_t expected, Operation&& operation) {
+  for (int64_t nth = 1;; ++nth) {
+    SCOPED_TRACE(nth);
+    ASSERT_LT(nth, 1000) << "never succeeded";
+    LiveBlockCheck blocks;
+    int32_t status = 0;
+    bool fired = false;
+    {
+      ScopedAllocationFailure failure(nth);
+      status = operation();
+      fired = failure.Fired();
+    }
+    if (!fired) {
+      EXPECT_EQ(status, 0);
+      EXPECT_GT(nth, 1) << "the operation allocated nothing that could fail";
+      return;
+    }
+    EXPECT_EQ(status, expected);
+  }
+}

@@ -20,7 +20,6 @@ namespace {
 
 class TypeManagerTest : public TypeSystemTest {};
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
 class NullFactory final : public TDTypeFactory {
  public:

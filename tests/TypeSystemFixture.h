@@ -6,6 +6,7 @@
 
 #include "TestSupport.h"
 #include "runtime/DSMemory.h"
+#include "runtime/PXPath.h"
 #include "runtime/PXServices.h"
 #include "vellum.h"
 
@@ -28,3 +29,17 @@ class TypeSystemTest : public ::testing::Test {
   ServiceManager services_;
   int64_t baseline_ = 0;
 };
+
+// A writable typedef link to the definition `viName` ("lib:file"), with a path when `pathized`.
+inline TDWTypedef Link(const std::string& viName, uint32_t timeStamp, bool pathized = false) {
+  QualifiedName name;
+  EXPECT_EQ(name.FromDelimitedName(viName), kStatusNoError);
+  Path path = nullptr;
+  if (pathized) {
+    EXPECT_EQ(FEmptyPath(&path), kStatusNoError);
+    EXPECT_EQ(FAppendName(path, U("\x07types.x")), kStatusNoError);
+  }
+  TDWTypedef link(name, timeStamp, path);
+  FDestroyPath(&path);
+  return link;
+}
