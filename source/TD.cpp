@@ -212,7 +212,9 @@ int32_t TDImp::CmpTD(const TDImp* source, int32_t, int32_t) const {
   return source->GetTypeCode() == GetTypeCode() ? 0 : kCmpIncompatible;
 }
 
-bool TDImp::ConversionIsLossless(const TDImp*) const { return false; }
+bool TDImp::ConversionIsLossless(const TDImp* dst) const {
+  return dst != nullptr && dst->GetTypeCode() == GetTypeCode();
+}
 
 TDTraverseValue TDImp::TraverseTD(TDVisitFn visit, void* context, TDShouldRecurseFn, TDImpPtr* replacement) {
   const TDTraverseValue result = visit(this, context, replacement);

@@ -2,6 +2,7 @@
 // slots, the copy-with-conversion dispatch and the report of damaged data.
 #include "source/TDDataManager.h"
 
+#include <atomic>
 #include <cstdio>
 
 #include "runtime/DebugStream.h"
@@ -102,4 +103,24 @@ int32_t ReportDamagedData(const TDImp& type, const void* data) {
   const int32_t status = RaveStatusForDamage();
   if (status != kStatusNoError) WriteVerifyDataMessage(status, type, data);
   return status;
+}
+
+int32_t TD::CompareClassData(int32_t how, const void* data, const TDR& other, TDR* dataType) const {
+  if (!imp_) return kStatusNullHandle;
+  TDImp* found = nullptr;
+  const int32_t status = imp_->CompareClassData(how, data, other.GetImp(), &found);
+  if (found != nullptr && dataType != nullptr) *dataType = MakeTDRFromTDImp(found);
+  return status;
+}
+
+namespace {
+std::atomic<const KoContext*> gProbeSourceContext{nullptr};
+}  // namespace
+
+void SetCopyDataConvertSourceContextForProbe(const KoContext* context) {
+  gProbeSourceContext.store(context, std::memory_order_relaxed);
+}
+
+const KoContext* GetCopyDataConvertSourceContextForProbe() {
+  return gProbeSourceContext.load(std::memory_order_relaxed);
 }

@@ -225,7 +225,7 @@ TEST_F(TDNumericTest, TypedHandlesAdmitTheirCodes) {
 
 TEST_F(TDNumericTest, MemberConstructorsCarryNameTypedefAndMember) {
   const TDWTypedef link(QualifiedName(), 7, nullptr);
-  const TDRUInt16 readOnly(MakeEnum({"off", "on"}), reinterpret_cast<const uint8_t*>("switch"), link);
+  const TDRUInt16 readOnly(MakeEnum({"off", "on"}), U("switch"), link);
   ASSERT_TRUE(readOnly);
   EXPECT_EQ(readOnly.GetTypeCode(), 0x16);
   EXPECT_EQ(readOnly.IsReadOnlyTD(), 1);
@@ -237,14 +237,14 @@ TEST_F(TDNumericTest, MemberConstructorsCarryNameTypedefAndMember) {
 
   // A writable descriptor made from interned members gets private copies of them.
   const TDRUnits interned = Meters(1).CheckIn();
-  TDWComplex128 writable(interned, reinterpret_cast<const uint8_t*>("z"));
+  TDWComplex128 writable(interned, U("z"));
   ASSERT_TRUE(writable);
   EXPECT_EQ(writable.GetTypeCode(), 0x1D);
   EXPECT_NE(writable.GetUnits().GetUnitsImpPtr(), interned.GetUnitsImpPtr());
   EXPECT_EQ(writable.GetUnits().SetUnit(kUnitSeconds, -1), 0);
   EXPECT_EQ(interned.GetExponent(kUnitSeconds), 0);
   EXPECT_EQ(writable.CheckIn(), TDRComplex128(Meters(1) << std::make_pair(kUnitSeconds, int16_t{-1}),
-                                              reinterpret_cast<const uint8_t*>("z")));
+                                              U("z")));
 }
 
 TEST_F(TDNumericTest, NumFlagsKeepTwoDescriptorsApart) {
@@ -266,10 +266,10 @@ TEST_F(TDNumericTest, NumFlagsKeepTwoDescriptorsApart) {
 }
 
 TEST_F(TDNumericTest, EqualDescriptorsInternToOneObject) {
-  const TDR a = TDRUInt8(MakeEnum({"red", "green"}), reinterpret_cast<const uint8_t*>("colour"));
-  const TDR b = TDRUInt8(MakeEnum({"red", "green"}), reinterpret_cast<const uint8_t*>("colour"));
-  const TDR reordered = TDRUInt8(MakeEnum({"green", "red"}), reinterpret_cast<const uint8_t*>("colour"));
-  const TDR plain = TDRUInt8(reinterpret_cast<const uint8_t*>("colour"));
+  const TDR a = TDRUInt8(MakeEnum({"red", "green"}), U("colour"));
+  const TDR b = TDRUInt8(MakeEnum({"red", "green"}), U("colour"));
+  const TDR reordered = TDRUInt8(MakeEnum({"green", "red"}), U("colour"));
+  const TDR plain = TDRUInt8(U("colour"));
   EXPECT_EQ(a, b);
   EXPECT_EQ(a.GetHashValue(), b.GetHashValue());
   EXPECT_NE(a, reordered);
@@ -980,7 +980,7 @@ TEST_F(TDNumericTest, RepresentationEnumeration) {
 // --- attributes, dump, factories --------------------------------------------------------------------
 
 TEST_F(TDNumericTest, CopyAttributesByMask) {
-  TDWFloat64 source(Meters(1), reinterpret_cast<const uint8_t*>("length"),
+  TDWFloat64 source(Meters(1), U("length"),
                     TDWTypedef(QualifiedName(), 3, nullptr));
   ASSERT_EQ(source.SetNoSelectMask(1), 0);
   const TDR from = source.CheckIn();
@@ -1015,10 +1015,10 @@ TEST_F(TDNumericTest, CopyAttributesByMask) {
 }
 
 TEST_F(TDNumericTest, DebugDump) {
-  TDWUInt16 type(MakeEnum({"a"}), reinterpret_cast<const uint8_t*>("n"));
+  TDWUInt16 type(MakeEnum({"a"}), U("n"));
   ASSERT_EQ(type.SetNumFlags(0x0B), 0);
   DebugCapture capture;
-  EXPECT_EQ(type.PrintDebugStr(reinterpret_cast<const uint8_t*>(">")), 0);
+  EXPECT_EQ(type.PrintDebugStr(U(">")), 0);
   const std::vector<std::string> texts = capture.Texts();
   ASSERT_GE(texts.size(), 5u);
   EXPECT_EQ(texts.front(), ">TypeDescriptor {");
@@ -1097,7 +1097,7 @@ TEST_F(TDNumericTest, NumbersDoNotMutateBooleans) {
 // --- running out of memory ------------------------------------------------------------------------
 
 TEST_F(TDNumericTest, CheckInSurvivesEveryAllocationFailure) {
-  TDWUInt32 type(MakeEnum({"one", "two", "three"}), reinterpret_cast<const uint8_t*>("counted"));
+  TDWUInt32 type(MakeEnum({"one", "two", "three"}), U("counted"));
   ASSERT_EQ(type.SetNumFlags(3), 0);
   TDR reference;
   for (int64_t nth = 1;; ++nth) {
@@ -1131,8 +1131,8 @@ TEST_F(TDNumericTest, ConstructionSurvivesEveryAllocationFailure) {
     bool fired = false;
     {
       ScopedAllocationFailure failure(nth);
-      const TDRFloat32 a(units, reinterpret_cast<const uint8_t*>("a"));
-      const TDWUInt8 b(items, reinterpret_cast<const uint8_t*>("b"));
+      const TDRFloat32 a(units, U("a"));
+      const TDWUInt8 b(items, U("b"));
       const TDRComplexExt c;
       fired = failure.Fired();
       if (!fired) {

@@ -188,6 +188,9 @@ class TD {
   int32_t CopyData(const void* src, void* dst, const KoContext* context, int32_t flags) const;
   // Whether every value of this type survives conversion into `other`; false when either is null.
   bool ConversionIsLossless(const TD& other) const;
+  // The kind's comparison of class data; 42 for a null handle. Kinds without one answer 0 and
+  // leave *dataType as it is.
+  int32_t CompareClassData(int32_t how, const void* data, const TDR& other, TDR* dataType) const;
 
  protected:
   TDImpPtr imp_;
@@ -294,6 +297,11 @@ TDW MakeDefaultTDWForTypeCode(int32_t code);
 // Zeroes the in-place bytes of one datum of `type` when `clear` is nonzero (nothing for a null
 // handle or null data). Handles inside the datum are not disposed.
 void TDImpClearMemory(void* data, const TD& type, int32_t clear);
+
+// A process-wide slot the host fills around the conversions it makes for probes; nothing in the
+// library reads it. Plain stores, meant for one converting thread at a time.
+void SetCopyDataConvertSourceContextForProbe(const KoContext* context);
+const KoContext* GetCopyDataConvertSourceContextForProbe();
 
 // The short type text: "null" for a null handle, otherwise the kind's text.
 std::string ToString(const TDR& type);

@@ -18,6 +18,8 @@ class ITargetPlatformAlignment {
   virtual int32_t IsBigEndian() const = 0;
   // In-place size of a numeric of that type code on the target.
   virtual int32_t NumericSize(int32_t typeCode) const = 0;
+  // The platform's four-character identifier; 0 when the platform has none.
+  virtual uint32_t PlatformIdentifier() const { return 0; }
 };
 
 // 0: no handles inside; 1: handles to variable-size blocks; 2: string-like.

@@ -1,0 +1,65 @@
+// Clusters: records whose elements lie in place one after another with alignment padding; their
+// layout and element offsets, data life cycle, copy and conversion, and compatibility.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+
+#include "source/TDContainer.h"
+
+// CmpTD result bit: the cluster element counts differ.
+constexpr int32_t kCmpEltCountsDiffer = 0x1000;
+
+class TDClusterImp : public TDMultiContainerImp {
+ public:
+  TDClusterImp() noexcept = default;
+  TDClusterImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink) noexcept
+      : TDMultiContainerImp(name, typedefLink) {}
+
+  // --- slots of TDImp --------------------------------------------------------------------------
+  int16_t GetTypeCode() const override { return static_cast<int16_t>(TypeCode::Cluster); }
+  TDImpPtr NewInstance() const override;
+  // Checks each element's data in order; the first damage is reported again with the element's
+  // offset, and its status returned.
+  int32_t VerifyData(const void* data, const KoContext* context) const override;
+  int32_t DataSizeCore(ITargetPlatformAlignment* platform) const override;
+  int32_t GetAlignment(ITargetPlatformAlignment* platform) const override;
+  // 1 when every element is present and defined.
+  int32_t DefinedType(int32_t how) const override;
+  // On a failure with onlyIfEmpty 0, what the earlier elements allocated is given back and the
+  // datum is left all zero.
+  int32_t InflateDefData(void* data, int32_t onlyIfEmpty, int32_t clearFirst, int32_t flags) const override;
+  int32_t DeflateData(void* data, void* end, int32_t dispose, const HandleAllocationInterface& allocator) const override;
+  DataShapes DataShapeOf(int32_t inMemory) const override;
+  int32_t ShrinkData(void* data, void* end, int32_t flag, const HandleAllocationInterface& allocator) const override;
+  int32_t IsFlatDataFixedSize() const override;
+  int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;
+  int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
+  int32_t ResetToDefaultData(void* data) const override;
+  void PrintDebugStr(const uint8_t* prefix) const override;
+  int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const override;
+  int32_t IsClust() const override { return 1; }
+  // Every element present and numeric (an empty cluster is not numeric).
+  int32_t IsNumericClust() const override;
+  // The shape {Boolean, Int32, String}; with `strict` nonzero also the names "status", "code"
+  // and "source".
+  int32_t IsErrorCluster(int32_t strict) const override;
+  // Some element is generic or semi-generic.
+  int32_t IsSemiGeneric() const override;
+
+  // --- cluster slots ---------------------------------------------------------------------------
+  // Where element `index` starts; 0 for index 0 and for an index beyond the list.
+  virtual int32_t GetEltOffset(int32_t index, ITargetPlatformAlignment* platform) const;
+  virtual int32_t GetNumEltsDeep() const;
+
+ private:
+  // Layout facts of the running process, kept only by interned clusters (which never change).
+  // A size or alignment entry records the SetDSAlign value it was computed with and is used only
+  // while that value holds; 0 means no entry.
+  mutable std::atomic<uint64_t> sizeCache_{0};
+  mutable std::atomic<uint64_t> alignmentCache_{0};
+  mutable std::atomic<int32_t> shapeCache_{-1};
+};
+
+// The cluster side of `type`; null when it is not a cluster.
+const TDClusterImp* AsCluster(const TDImp* type);

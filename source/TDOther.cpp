@@ -1,0 +1,111 @@
+// The plain pointer kinds: their objects, layout, the pointer copies of Ptr and PtrTo, factories
+// and handles. CStr and PStr data belongs to the caller: the generic copy refuses it.
+#include "source/TDOther.h"
+
+#include <cstring>
+#include <string>
+
+#include "runtime/DebugStream.h"
+#include "runtime/PXStrings.h"
+#include "source/TDStringBase.h"
+#include "source/TypeManager.h"
+
+namespace {
+
+constexpr int32_t kPointerSize = 8;
+
+int32_t PointerSize(ITargetPlatformAlignment* platform) {
+  return platform != nullptr ? platform->PointerSize() : kPointerSize;
+}
+
+std::string PrefixText(const uint8_t* prefix) {
+  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
+}
+
+void PrintKind(const TDImp& type, const char* kind, const uint8_t* prefix) {
+  DebugReport(__FILE__, __LINE__, 0, PrefixText(prefix) + "type = " + kind);
+  type.TDImp::PrintDebugStr(prefix);
+}
+
+int32_t CopyPointer(const void* src, void* dst) {
+  if (src == nullptr || dst == nullptr) return kStatusBadArgument;
+  MoveBlock(src, dst, sizeof(void*));
+  return kStatusNoError;
+}
+
+// A pointer converts only into its own kind.
+int32_t ConvertPointer(const TDImp& self, const TDImp* dst, const void* src, void* dstData) {
+  if (dst == nullptr || dst->GetTypeCode() != self.GetTypeCode()) {
+    ReportConvertCodes(dst, self);
+    return kStatusBadArgument;
+  }
+  return CopyPointer(src, dstData);
+}
+
+template <class Imp>
+class PlainFactory final : public TDTypeFactory {
+ public:
+  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
+    TDImpPtr type = MakeCounted<Imp>();
+    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
+    return type;
+  }
+};
+
+PlainFactory<TDPtrToImp> gPtrToFactory;
+PlainFactory<TDPtrImp> gPtrFactory;
+PlainFactory<TDPStrImp> gPStrFactory;
+PlainFactory<TDCStrImp> gCStrFactory;
+
+// Announced as the library loads; the service registers them in this order at start.
+const bool gAnnounced = [] {
+  AnnounceTypeFactory(41, static_cast<uint16_t>(TypeCode::PtrTo), &gPtrToFactory);
+  AnnounceTypeFactory(42, static_cast<uint16_t>(TypeCode::Ptr), &gPtrFactory);
+  AnnounceTypeFactory(43, static_cast<uint16_t>(TypeCode::PStr), &gPStrFactory);
+  AnnounceTypeFactory(44, static_cast<uint16_t>(TypeCode::CStr), &gCStrFactory);
+  return true;
+}();
+
+template <class Imp>
+TDImpPtr MakeNamed(const uint8_t* name) {
+  bool failed = false;
+  TDNameImpPtr label = MakeNameFromCStr(name, &failed);
+  if (failed) return TDImpPtr();
+  return TDImpPtr(MakeCounted<Imp>(label, TDTypedefImpPtr()));
+}
+
+}  // namespace
+
+TDImpPtr TDCStrImp::NewInstance() const { return MakeCounted<TDCStrImp>(); }
+int32_t TDCStrImp::DataSizeCore(ITargetPlatformAlignment* platform) const { return PointerSize(platform); }
+void TDCStrImp::PrintDebugStr(const uint8_t* prefix) const { PrintKind(*this, "cstr", prefix); }
+
+TDImpPtr TDPStrImp::NewInstance() const { return MakeCounted<TDPStrImp>(); }
+int32_t TDPStrImp::DataSizeCore(ITargetPlatformAlignment* platform) const { return PointerSize(platform); }
+void TDPStrImp::PrintDebugStr(const uint8_t* prefix) const { PrintKind(*this, "pstr", prefix); }
+
+TDImpPtr TDPtrImp::NewInstance() const { return MakeCounted<TDPtrImp>(); }
+int32_t TDPtrImp::DataSizeCore(ITargetPlatformAlignment* platform) const { return PointerSize(platform); }
+int32_t TDPtrImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const { return CopyPointer(src, dst); }
+int32_t TDPtrImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t) const {
+  return ConvertPointer(*this, dst, src, dstData);
+}
+void TDPtrImp::PrintDebugStr(const uint8_t* prefix) const { PrintKind(*this, "ptr", prefix); }
+
+TDImpPtr TDPtrToImp::NewInstance() const { return MakeCounted<TDPtrToImp>(); }
+int32_t TDPtrToImp::DataSizeCore(ITargetPlatformAlignment* platform) const { return PointerSize(platform); }
+int32_t TDPtrToImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {
+  return CopyPointer(src, dst);
+}
+int32_t TDPtrToImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t) const {
+  return ConvertPointer(*this, dst, src, dstData);
+}
+
+bool CStrKind::Admit(const TDImp& type) { return type.IsCStr() != 0; }
+TDImpPtr CStrKind::New(const uint8_t* name) { return MakeNamed<TDCStrImp>(name); }
+bool PStrKind::Admit(const TDImp& type) { return type.IsPStr() != 0; }
+TDImpPtr PStrKind::New(const uint8_t* name) { return MakeNamed<TDPStrImp>(name); }
+bool PtrKind::Admit(const TDImp& type) { return type.IsPtr() != 0; }
+TDImpPtr PtrKind::New(const uint8_t* name) { return MakeNamed<TDPtrImp>(name); }
+bool PtrToKind::Admit(const TDImp& type) { return type.IsPtrTo() != 0; }
+TDImpPtr PtrToKind::New(const uint8_t* name) { return MakeNamed<TDPtrToImp>(name); }
