@@ -86,7 +86,9 @@ void TDPStrImp::PrintDebugStr(const uint8_t* prefix) const { PrintKind(*this, "p
 
 TDImpPtr TDPtrImp::NewInstance() const { return MakeCounted<TDPtrImp>(); }
 int32_t TDPtrImp::DataSizeCore(ITargetPlatformAlignment* platform) const { return PointerSize(platform); }
-int32_t TDPtrImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const { return CopyPointer(src, dst); }
+int32_t TDPtrImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {
+  return CopyPointer(src, dst);
+}
 int32_t TDPtrImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t) const {
   return ConvertPointer(*this, dst, src, dstData);
 }

@@ -4,6 +4,7 @@
 #include "source/TDStringBase.h"
 
 #include <algorithm>
+#include <cstddef>
 #include <cstdio>
 #include <cstring>
 #include <functional>
@@ -27,6 +28,7 @@ using vellum::bound::IsFixed;
 using vellum::bound::IsVariable;
 
 constexpr int32_t kPointerSize = 8;
+constexpr size_t kLengthWordSize = sizeof(int32_t);
 
 // The elements of the "SubStringRec" cluster that describes a SubString datum.
 constexpr int32_t kRecordDataPtr = 0;
@@ -34,7 +36,6 @@ constexpr int32_t kRecordLength = 1;
 constexpr int32_t kRecordElements = 3;
 
 const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
-constexpr size_t kLengthWordSize = sizeof(int32_t);
 
 // Data may sit at any offset of a packed cluster: handles and records are moved bytewise.
 template <class T>
@@ -164,7 +165,9 @@ int32_t CopyIntoLStrData(const TDStringBaseImp& dstType, LStrHandle src, void* d
 int32_t StringKindCmpTD(const TDStringBaseImp& self, const TDImp* source, int32_t flags) {
   int32_t result = 0;
   if (source->IsString() != 0) {
-    if (source->GetTypeCode() != self.GetTypeCode() && (flags & kCmpFlagNoStringSizeBits) == 0) result |= kCmpStringSizesDiffer;
+    if (source->GetTypeCode() != self.GetTypeCode() && (flags & kCmpFlagNoStringSizeBits) == 0) {
+      result |= kCmpStringSizesDiffer;
+    }
   } else if (source->IsTag() != 0) {
     result |= self.IsSubStringOnly() != 0 ? kCmpSubStringMeetsTag : kCmpStringMeetsTag;
   } else if (source->IsRefnumTag() != 0) {
@@ -504,7 +507,9 @@ int32_t TDStringBaseImp::CopyDataConvertCore(const TDImp* dst, const void* src, 
 TDImpPtr TDStringImp::NewInstance() const { return MakeCounted<TDStringImp>(); }
 
 int32_t TDStringImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const {
-  if (dst == nullptr || dst->IsSubStringOnly() == 0) return TDStringBaseImp::CopyDataConvertCore(dst, src, dstData, flags);
+  if (dst == nullptr || dst->IsSubStringOnly() == 0) {
+    return TDStringBaseImp::CopyDataConvertCore(dst, src, dstData, flags);
+  }
   if (src == nullptr || dstData == nullptr) return kStatusBadArgument;
   const auto h = Load<LStrHandle>(src);
   SubStringRec rec{nullptr, 0, 1};

@@ -32,7 +32,8 @@ class TDStringBaseImp : public TDImp {
   // A zeroed block of 4 + n bytes (n the fixed length or the bound; length word n when fixed);
   // nothing for n = 0 unless only-if-empty finds a null handle.
   int32_t InflateDefData(void* data, int32_t onlyIfEmpty, int32_t clearFirst, int32_t flags) const override;
-  int32_t DeflateData(void* data, void* end, int32_t dispose, const HandleAllocationInterface& allocator) const override;
+  int32_t DeflateData(void* data, void* end, int32_t dispose,
+                      const HandleAllocationInterface& allocator) const override;
   DataShapes DataShapeOf(int32_t) const override { return kDataShapeStringLike; }
   // With flag 0, a variable string's handle larger than 4 bytes is given back whole (the value
   // is meant to be dead): the result is its size.
@@ -123,7 +124,8 @@ class TDPathImp final : public TDStringBaseImp {
   // A path object whose type or names are not sane.
   int32_t VerifyData(const void* data, const KoContext* context) const override;
   int32_t InflateDefData(void* data, int32_t onlyIfEmpty, int32_t clearFirst, int32_t flags) const override;
-  int32_t DeflateData(void* data, void* end, int32_t dispose, const HandleAllocationInterface& allocator) const override;
+  int32_t DeflateData(void* data, void* end, int32_t dispose,
+                      const HandleAllocationInterface& allocator) const override;
   // Path objects keep no spare memory to give back.
   int32_t ShrinkData(void*, void*, int32_t, const HandleAllocationInterface&) const override { return 0; }
   int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;

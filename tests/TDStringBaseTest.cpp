@@ -171,6 +171,25 @@ TEST_F(TDStringBaseTest, DefaultBlocksAreExact) {
   EXPECT_EQ(held.Text(), "xy");
 }
 
+// A packed cluster puts a handle or a record at any offset.
+TEST_F(TDStringBaseTest, DataAtAnOddOffset) {
+  alignas(8) uint8_t buffer[40] = {};
+  void* handleAt = buffer + 1;
+  void* recordAt = buffer + 11;
+  const TDR fixed = TDRString(nullptr, vellum::bound::Fixed(2));
+  ASSERT_EQ(fixed.InflateDefData(handleAt, 0, 1, 0), kStatusNoError);
+  Str source("xyz");
+  ASSERT_EQ(fixed.CopyData(&source.h, handleAt, nullptr, 0), kStatusNoError);
+  EXPECT_EQ(fixed.VerifyData(handleAt, nullptr), kStatusNoError);
+  ASSERT_EQ(GetStringTD().GetImp()->CopyDataConvertCore(GetSubStringTD().GetImp(), &source.h, recordAt, 0),
+            kStatusNoError);
+  EXPECT_EQ(GetSubStringTD().VerifyData(recordAt, nullptr), kStatusNoError);
+  ASSERT_EQ(GetSubStringTD().GetImp()->CopyDataConvertCore(fixed.GetImp(), recordAt, handleAt, 0), kStatusNoError);
+  ASSERT_EQ(fixed.ResetToDefaultData(handleAt), kStatusNoError);
+  EXPECT_EQ(fixed.DeflateData(handleAt, buffer + sizeof buffer, 1, NormalHandleAllocator()), 6);
+  EXPECT_EQ(fixed.VerifyData(handleAt, nullptr), kStatusNoError) << "disposed: null again";
+}
+
 TEST_F(TDStringBaseTest, CopyLStr) {
   Str empty("");
   Str stays;
@@ -430,8 +449,10 @@ TEST_F(TDStringBaseTest, VerifyDataFindsDamageWithoutReadingPastTheHandle) {
     ASSERT_EQ(texts.size(), 1u);
     EXPECT_EQ(texts[0].rfind("##VerifyData err 0x00000055 at type=0x0033, data=0x", 0), 0u) << texts[0];
   }
+  DebugCapture capture;
   SubStringRec bad{nullptr, 3, 1};
   EXPECT_EQ(GetSubStringTD().VerifyData(&bad, nullptr), 0x55);
+  EXPECT_EQ(capture.Texts().size(), 1u);
 }
 
 TEST_F(TDStringBaseTest, ResetDeflateAndShrink) {

@@ -53,6 +53,8 @@ class TDRAlignmentMarker;
 class TDWAlignmentMarker;
 
 // Setters below return 42 for a null handle and 0 otherwise, and change the descriptor's hash.
+// A block handle's GetAlignment() is the stored alignment word; the layout alignment for a
+// platform is TD::GetAlignment(platform), reached through a `const TD&`.
 
 // Blocks of a stated byte size: Block and AlignedBlock.
 class TDRSizedBlock : public TDRTyped<TDRSizedBlock, TDWSizedBlock, TDR, SizedBlockKind> {

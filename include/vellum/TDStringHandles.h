@@ -86,6 +86,7 @@ class TDWStringBase;
 class TDRStringBase : public TDRTyped<TDRStringBase, TDWStringBase, TDR, StringBaseKind> {
  public:
   using TDRTyped::TDRTyped;
+  // -1 for a null handle.
   int32_t GetBound() const;
 };
 
