@@ -3,6 +3,7 @@
 
 #include "vellum/QualifiedName.h"
 #include "vellum/QXLStr.h"
+#include "vellum/TDArrayHandles.h"
 #include "vellum/TDAttributeHandles.h"
 #include "vellum/TDBlockHandles.h"
 #include "vellum/TDContainerHandles.h"

@@ -6,6 +6,7 @@
 #include <algorithm>
 #include <cstring>
 #include <limits>
+#include <new>
 #include <string>
 
 #include "runtime/DebugStream.h"
@@ -275,6 +276,7 @@ int32_t TDClusterImp::IsFlatDataFixedSize() const {
 
 int32_t TDClusterImp::GetEltOffset(int32_t index, ITargetPlatformAlignment* platform) const {
   if (index <= 0 || index >= GetNumElts()) return 0;
+  if (platform == nullptr && HasRecordedLayout()) return offsets_[static_cast<size_t>(index)];
   EltCursor cursor(*this, platform);
   while (cursor.Next() && cursor.Index() < index) {
   }
@@ -288,6 +290,66 @@ int32_t TDClusterImp::GetNumEltsDeep() const {
     if (const TDClusterImp* nested = AsCluster(GetEltImpPtr(i).get())) deep += nested->GetNumEltsDeep();
   }
   return deep;
+}
+
+// --- recorded layout -------------------------------------------------------------------------------
+
+int32_t TDClusterImp::MemberCheckIn(TDImpPtr& target) const {
+  const int32_t status = TDMultiContainerImp::MemberCheckIn(target);
+  if (status != kStatusNoError) return status;
+  return static_cast<TDClusterImp&>(*target).RecordLayout();
+}
+
+int32_t TDClusterImp::RecordLayout() {
+  const int32_t dsAlign = GetDSAlign();
+  layoutDSAlign_ = -1;
+  offsets_.clear();
+  steps_.clear();
+  try {
+    offsets_.reserve(static_cast<size_t>(GetNumElts()));
+    EltCursor cursor(*this, nullptr);
+    while (cursor.Next()) {
+      const auto offset = static_cast<int32_t>(std::min(cursor.Offset(), kMaxDataSize));
+      const auto end = static_cast<int32_t>(std::min(cursor.End(), kMaxDataSize));
+      offsets_.push_back(offset);
+      const TDImp* element = cursor.Element();
+      if (element == nullptr || end == offset) continue;
+      if (element->DataShapeOf(1) != kDataShapePlain) {
+        steps_.push_back(DataStep{element, offset, end - offset});
+      } else if (!steps_.empty() && steps_.back().element == nullptr) {
+        // Bytes next to bytes (padding between them included) move as one run.
+        steps_.back().size = end - steps_.back().offset;
+      } else {
+        steps_.push_back(DataStep{nullptr, offset, end - offset});
+      }
+    }
+  } catch (const std::bad_alloc&) {
+    offsets_.clear();
+    steps_.clear();
+    return kStatusOutOfMemory;
+  }
+  layoutDSAlign_ = dsAlign;
+  return kStatusNoError;
+}
+
+template <class Step>
+int32_t TDClusterImp::ForEachDataStep(Step step) const {
+  if (HasRecordedLayout()) {
+    for (const DataStep& s : steps_) {
+      const int32_t status = step(s.element, static_cast<int64_t>(s.offset), static_cast<int64_t>(s.size));
+      if (status != kStatusNoError) return status;
+    }
+    return kStatusNoError;
+  }
+  EltCursor cursor(*this, nullptr);
+  while (cursor.Next()) {
+    const TDImp* element = cursor.Element();
+    if (element == nullptr || cursor.Size() == 0) continue;
+    const TDImp* handles = element->DataShapeOf(1) != kDataShapePlain ? element : nullptr;
+    const int32_t status = step(handles, cursor.Offset(), cursor.Size());
+    if (status != kStatusNoError) return status;
+  }
+  return kStatusNoError;
 }
 
 // --- data ------------------------------------------------------------------------------------------
@@ -323,55 +385,48 @@ int32_t TDClusterImp::ResetToDefaultData(void* data) const {
     TDImpClearMemory(data, this, 1);
     return kStatusNoError;
   }
-  EltCursor cursor(*this, nullptr);
-  while (cursor.Next()) {
-    if (cursor.Element() == nullptr) continue;
-    const int32_t status = cursor.Element()->ResetToDefaultData(At(data, cursor.Offset()));
-    if (status != kStatusNoError) return status;
-  }
-  return kStatusNoError;
+  return ForEachDataStep([data](const TDImp* element, int64_t offset, int64_t size) {
+    if (element != nullptr) return element->ResetToDefaultData(At(data, offset));
+    ClearMem(At(data, offset), static_cast<size_t>(size));
+    return kStatusNoError;
+  });
 }
 
 int32_t TDClusterImp::DeflateData(void* data, void* end, int32_t dispose,
                                   const HandleAllocationInterface& allocator) const {
   if (data == nullptr || !Below(data, end) || DataShapeOf(1) == kDataShapePlain) return 0;
   int32_t released = 0;
-  EltCursor cursor(*this, nullptr);
-  while (cursor.Next()) {
-    if (cursor.Element() == nullptr) continue;
-    void* element = At(data, cursor.Offset());
-    if (!Below(element, end)) break;
-    released += cursor.Element()->DeflateData(element, CutEnd(element, cursor.Size(), end), dispose, allocator);
-  }
+  ForEachDataStep([&](const TDImp* element, int64_t offset, int64_t size) {
+    if (element == nullptr) return kStatusNoError;
+    void* at = At(data, offset);
+    if (!Below(at, end)) return kStatusBadArgument;  // stops the walk
+    released += element->DeflateData(at, CutEnd(at, size, end), dispose, allocator);
+    return kStatusNoError;
+  });
   return released;
 }
 
 int32_t TDClusterImp::ShrinkData(void* data, void* end, int32_t flag, const HandleAllocationInterface& allocator) const {
   if (data == nullptr || !Below(data, end) || DataShapeOf(1) == kDataShapePlain) return 0;
   int32_t released = 0;
-  EltCursor cursor(*this, nullptr);
-  while (cursor.Next()) {
-    if (cursor.Element() == nullptr) continue;
-    void* element = At(data, cursor.Offset());
-    if (!Below(element, end)) break;
-    released += cursor.Element()->ShrinkData(element, CutEnd(element, cursor.Size(), end), flag, allocator);
-  }
+  ForEachDataStep([&](const TDImp* element, int64_t offset, int64_t size) {
+    if (element == nullptr) return kStatusNoError;
+    void* at = At(data, offset);
+    if (!Below(at, end)) return kStatusBadArgument;  // stops the walk
+    released += element->ShrinkData(at, CutEnd(at, size, end), flag, allocator);
+    return kStatusNoError;
+  });
   return released;
 }
 
 int32_t TDClusterImp::VerifyData(const void* data, const KoContext* context) const {
   if (data == nullptr || DataShapeOf(1) == kDataShapePlain) return kStatusNoError;
-  EltCursor cursor(*this, nullptr);
-  while (cursor.Next()) {
-    const TDImp* element = cursor.Element();
-    if (element == nullptr || element->DataShapeOf(1) == kDataShapePlain) continue;
-    const int32_t status = element->VerifyData(At(data, cursor.Offset()), context);
-    if (status != kStatusNoError) {
-      WriteVerifyDataMessage(status, *this, data, cursor.Offset());
-      return status;
-    }
-  }
-  return kStatusNoError;
+  return ForEachDataStep([&](const TDImp* element, int64_t offset, int64_t) {
+    if (element == nullptr) return kStatusNoError;
+    const int32_t status = element->VerifyData(At(data, offset), context);
+    if (status != kStatusNoError) WriteVerifyDataMessage(status, *this, data, offset);
+    return status;
+  });
 }
 
 int32_t TDClusterImp::CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const {
@@ -387,21 +442,12 @@ int32_t TDClusterImp::CopyData(const void* src, void* dst, int32_t flags, const 
     MoveBlock(src, dst, static_cast<size_t>(DataSizeCore(nullptr)));
     return kStatusNoError;
   }
-  EltCursor cursor(*this, nullptr);
-  while (cursor.Next()) {
-    const TDImp* element = cursor.Element();
-    if (element == nullptr) continue;
-    const void* from = At(src, cursor.Offset());
-    void* into = At(dst, cursor.Offset());
-    // Data without handles is its bytes, as a cluster of such elements is copied as one block.
-    if (element->DataShapeOf(1) == kDataShapePlain) {
-      MoveBlock(from, into, static_cast<size_t>(cursor.Size()));
-      continue;
-    }
-    const int32_t status = element->CopyData(from, into, flags, context);
-    if (status != kStatusNoError) return status;
-  }
-  return kStatusNoError;
+  // Data without handles is its bytes, as a cluster of such elements is copied as one block.
+  return ForEachDataStep([&](const TDImp* element, int64_t offset, int64_t size) {
+    if (element != nullptr) return element->CopyData(At(src, offset), At(dst, offset), flags, context);
+    MoveBlock(At(src, offset), At(dst, offset), static_cast<size_t>(size));
+    return kStatusNoError;
+  });
 }
 
 int32_t TDClusterImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const {

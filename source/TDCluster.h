@@ -4,6 +4,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <vector>
 
 #include "source/TDContainer.h"
 
@@ -47,12 +48,36 @@ class TDClusterImp : public TDMultiContainerImp {
   // Some element is generic or semi-generic.
   int32_t IsSemiGeneric() const override;
 
+  // The interned copy also records its layout for the SetDSAlign value in force (2 when memory
+  // runs out).
+  int32_t MemberCheckIn(TDImpPtr& target) const override;
+
   // --- cluster slots ---------------------------------------------------------------------------
   // Where element `index` starts; 0 for index 0 and for an index beyond the list.
   virtual int32_t GetEltOffset(int32_t index, ITargetPlatformAlignment* platform) const;
   virtual int32_t GetNumEltsDeep() const;
 
  private:
+  // One step of a walk over a datum: an element with handles, or (element null) a run of bytes
+  // without handles that is copied or cleared as it is.
+  struct DataStep {
+    const TDImp* element;
+    int32_t offset;
+    int32_t size;
+  };
+
+  int32_t RecordLayout();
+  bool HasRecordedLayout() const { return layoutDSAlign_ >= 0 && layoutDSAlign_ == GetDSAlign(); }
+  // Calls `step(element or null, offset, size)` over the datum in order while it returns 0; the
+  // first other status.
+  template <class Step>
+  int32_t ForEachDataStep(Step step) const;
+
+  // The layout of an interned cluster for the running process, made at check-in with the
+  // SetDSAlign value then in force (-1: none); used only while that value holds.
+  int32_t layoutDSAlign_ = -1;
+  std::vector<int32_t, PXAllocator<int32_t>> offsets_;
+  std::vector<DataStep, PXAllocator<DataStep>> steps_;
   // Layout facts of the running process, kept only by interned clusters (which never change).
   // A size or alignment entry records the SetDSAlign value it was computed with and is used only
   // while that value holds; 0 means no entry.

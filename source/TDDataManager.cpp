@@ -79,11 +79,11 @@ int32_t CopyDataConvertImp(const TDImp* srcType, const TDImp* dstType, const voi
   return srcType->CopyDataConvertCore(dstType, src, dstData, flags);
 }
 
-int32_t RaveStatusForDamage() {
+int32_t RaveStatusForDamage(int32_t code) {
   TDRaveProc rave = GetTDRaveProc();
   if (rave == nullptr) return kStatusBadArgument;
   int32_t status = kStatusNoError;
-  rave(nullptr, nullptr, status, kRaveVerifyData);
+  rave(nullptr, nullptr, status, code);
   return status;
 }
 

@@ -19,9 +19,9 @@ int32_t CopyDataConvertImp(const TDImp* srcType, const TDImp* dstType, const voi
                            int32_t flags);
 
 // The status to report for damaged data: what the rave procedure (SetTDRaveProc) leaves when
-// called with kRaveVerifyData; without a procedure the damage is reported as status 1, never
-// as sound data.
-int32_t RaveStatusForDamage();
+// called with `code` (kRaveVerifyData unless a family says otherwise); without a procedure the
+// damage is reported as status 1, never as sound data.
+int32_t RaveStatusForDamage(int32_t code = kRaveVerifyData);
 // The one diagnostic line of damaged data: the status, the type code and the data address, and
 // for an element of a container its offset.
 void WriteVerifyDataMessage(int32_t status, const TDImp& type, const void* data,

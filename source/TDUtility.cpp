@@ -9,6 +9,7 @@
 
 #include "runtime/PXNumbers.h"
 #include "source/TypeManager.h"
+#include "vellum/TDArrayHandles.h"
 #include "vellum/TDContainerHandles.h"
 #include "vellum/TDNumericHandles.h"
 #include "vellum/TDSimpleHandles.h"
@@ -45,6 +46,10 @@ TDR TDRFromSubType(const TDR& type) {
     const TDRString converted = TDRSubString(type.GetImpPtr(), 1).ConvertToString();
     return converted ? TDR(converted) : type;
   }
+  if (type.GetTypeCode() == static_cast<int16_t>(TypeCode::SubArray)) {
+    const TDRArray converted = TDRSubArray(type.GetImpPtr(), 1).ConvertToArray();
+    return converted ? TDR(converted) : type;
+  }
   return type;
 }
 
@@ -78,6 +83,15 @@ std::string ValueToString(const TDR& type, const void* data) {
     default:
       return "?";
   }
+}
+
+int32_t BoundedOrFixedArrayType(const TDR& array) {
+  const TDRArray type(array.GetImpPtr(), 1);
+  if (!type) {
+    DebugReport(__FILE__, __LINE__, 4, "Bad array");
+    return static_cast<int32_t>(0x80000000u);
+  }
+  return type.BoundedOrFixed();
 }
 
 int32_t IsMDTAnalogWaveformFlavor(uint16_t flavor) {

@@ -1,6 +1,6 @@
 // Blocks: the factories' defaults, layout with and without a platform, the handles' setters,
 // identity and order, the data of repeated blocks (handles inside included), conversion with its
-// refusals, the registered subarray record clusters and the debug dumps.
+// refusals, and the registered subarray record clusters.
 #include "source/TDBlock.h"
 
 #include <gtest/gtest.h>
@@ -354,28 +354,6 @@ TEST_F(TDBlockTest, SubArrayRecordClusters) {
     EXPECT_EQ(specifier.DataSize(c.platform), c.specifierSize);
     EXPECT_EQ(record.GetEltOffsetByName(U("dimensionSpecifier"), c.platform), c.dimensions);
     EXPECT_EQ(record.DataSize(c.platform), c.recordSize);
-  }
-}
-
-TEST_F(TDBlockTest, DebugDumps) {
-  struct Case {
-    TDR type;
-    std::vector<std::string> lines;
-  };
-  const Case kCases[] = {
-      {Block(5), {"\ttype = block", "\tblock size = 5"}},
-      {AlignedBlock(6, 4), {"\ttype = aligned block", "\tblock size = 6", "\talignment = 4"}},
-      {Repeated(GetiW(), 3), {"\ttype = repeated block", "\tnumber of blocks = 3"}},
-      {VoidBlock(2), {"\ttype = void block", "\talignment = 2"}},
-      {TypeBlock(GetiL()), {"\ttype = type block", "\talignment = 0"}},
-  };
-  for (const Case& c : kCases) {
-    SCOPED_TRACE(c.lines[0]);
-    DebugCapture capture;
-    c.type.PrintDebugStr();
-    const std::vector<std::string> texts = capture.Texts();
-    ASSERT_GT(texts.size(), c.lines.size());
-    for (size_t i = 0; i < c.lines.size(); ++i) EXPECT_EQ(texts[i + 1], c.lines[i]);
   }
 }
 

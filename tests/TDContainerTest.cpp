@@ -435,15 +435,4 @@ TEST_F(TDContainerTest, ConcurrentCheckInsMakeOneObject) {
   for (const TDR& result : results) EXPECT_TRUE(result == results[0]);
 }
 
-TEST_F(TDContainerTest, DebugDumpListsTheElements) {
-  DebugCapture capture;
-  Cluster({GetiL(), GetBoolTD()}).PrintDebugStr();
-  const std::vector<std::string> texts = capture.Texts();
-  ASSERT_GE(texts.size(), 4u);
-  EXPECT_EQ(texts[0], "TypeDescriptor {");
-  EXPECT_EQ(texts[1], "\ttype = cluster");
-  EXPECT_TRUE(capture.Contains("number of elements = 2"));
-  EXPECT_EQ(texts.back(), "\t}");
-}
-
 }  // namespace

@@ -1,5 +1,4 @@
-// Type utilities: the scalar test, view removal, the context walk, the value text and the
-// analog waveform flavors.
+// Type utilities: the scalar test, view removal, the context walk and the value text.
 #include "source/TDUtility.h"
 
 #include <gtest/gtest.h>
@@ -92,14 +91,6 @@ TEST_F(TDUtilityTest, ValueText) {
   const uint64_t zero = 0;
   EXPECT_EQ(ValueToString(TDR(), &zero), "NULL");
   EXPECT_EQ(ValueToString(GetiL(), nullptr), "NULL");
-}
-
-TEST_F(TDUtilityTest, AnalogWaveformFlavors) {
-  for (uint16_t flavor = 0; flavor < 40; ++flavor) {
-    const bool analog = flavor == 1 || flavor == 2 || flavor == 3 || flavor == 5 || (flavor >= 10 && flavor <= 20);
-    EXPECT_EQ(IsMDTAnalogWaveformFlavor(flavor), analog ? 1 : 0) << flavor;
-  }
-  EXPECT_EQ(IsMDTAnalogWaveformFlavor(0xFFFF), 0);
 }
 
 }  // namespace

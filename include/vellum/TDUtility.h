@@ -10,8 +10,8 @@
 int32_t IsScalarType(const TDR& type);
 // A measure-data descriptor's element cluster; any other descriptor itself.
 TDR IgnoreMDTWrapper(const TDR& type);
-// What a view kind converts to: a SubString's string (a SubArray's array once arrays exist);
-// any other descriptor itself.
+// What a view kind converts to: a SubString's string, a SubArray's array; any other descriptor
+// itself.
 TDR TDRFromSubType(const TDR& type);
 // The first context found in a walk of `type` (pre-order, elements in order); null when none.
 const KoContext* TDRGetContextIfAvailable(const TDR& type);
@@ -19,6 +19,10 @@ const KoContext* TDRGetContextIfAvailable(const TDR& type);
 // as a standard stream prints them by default (8-bit integers as numbers, Booleans as 0 or 1);
 // "?" for every other kind; "NULL" for a null type or null data.
 std::string ValueToString(const TDR& type, const void* data);
+// The element-count word of an Array (TDRArrayBase::BoundedOrFixed): -1 when a dimension is
+// variable, 0x80000001 for no dimensions, else the product of the sizes with bit 31 set when all
+// are fixed. Anything but an Array is reported ("Bad array", level 4) and gives 0x80000000.
+int32_t BoundedOrFixedArrayType(const TDR& array);
 // 1 for the analog waveform flavors 1, 2, 3, 5 and 10 to 20.
 int32_t IsMDTAnalogWaveformFlavor(uint16_t flavor);
 
