@@ -11,16 +11,8 @@
 
 namespace {
 
-class AlignmentMarkerFactory final : public TDTypeFactory {
- public:
-  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
-    TDImpPtr type = MakeCounted<TDAlignmentMarkerImp>();
-    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
-    return type;
-  }
-};
 
-AlignmentMarkerFactory gAlignmentMarkerFactory;
+EmptyTypeFactory<TDAlignmentMarkerImp> gAlignmentMarkerFactory;
 
 // Announced as the library loads; the service registers it first at start.
 const bool gAnnounced = [] {

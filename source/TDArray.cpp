@@ -440,7 +440,8 @@ int32_t ConvertIntoArray(const TDArrayImp& dstType, const TDArrayBaseImp& srcTyp
     const int32_t status =
         ResizeToSizes(into, &h, [&source](int32_t d) { return source.Size(d); }, source.dims, "SetArraySizeFromTDPtr");
     Store(dstData, h);
-    if (status != kStatusNoError || source.first == nullptr) return status;
+    // Elements without bytes (Void) have nothing to convert, however many there are.
+    if (status != kStatusNoError || source.first == nullptr || into.eltSize == 0) return status;
     return WalkRowMajor(source, [&source](int32_t d) { return source.Size(d); }, srcCount, convert);
   }
 
@@ -453,6 +454,8 @@ int32_t ConvertIntoArray(const TDArrayImp& dstType, const TDArrayBaseImp& srcTyp
     if (status != kStatusNoError) return status;
     h = Load<UHandle>(dstData);
   }
+  // A count word of 0 holds no element: its default may be no block at all.
+  if (h == nullptr && word == 0) return kStatusNoError;
   if (h == nullptr || static_cast<int64_t>(DSGetHandleSize(h)) < capacityBytes) {
     ReportPreallocatedExisting();
     return kStatusOutOfMemory;
@@ -1454,19 +1457,10 @@ int32_t TDArrayDataPtrImp::DataSizeCore(ITargetPlatformAlignment* platform) cons
 namespace {
 
 // Read descriptors start without a dimension list; reading their payload gives them one.
-template <class Imp>
-class ArrayFactory final : public TDTypeFactory {
- public:
-  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
-    TDImpPtr type = MakeCounted<Imp>();
-    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
-    return type;
-  }
-};
 
-ArrayFactory<TDArrayImp> gArrayFactory;
-ArrayFactory<TDSubArrayImp> gSubArrayFactory;
-ArrayFactory<TDArrayDataPtrImp> gArrayDataPtrFactory;
+EmptyTypeFactory<TDArrayImp> gArrayFactory;
+EmptyTypeFactory<TDSubArrayImp> gSubArrayFactory;
+EmptyTypeFactory<TDArrayDataPtrImp> gArrayDataPtrFactory;
 
 // Announced as the library loads; the service registers them in this place at start.
 const bool gAnnounced = [] {

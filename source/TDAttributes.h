@@ -4,6 +4,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <cstring>
 #include <string>
 
 #include "runtime/DSMemory.h"
@@ -117,3 +118,15 @@ class TDTypedefImp final : public TDAttributeImp {
 // What the dictionaries call to match interned attributes.
 inline bool InternEqual(const TDAttributeImp& a, const TDAttributeImp& b) { return a.IsEqual(b) != 0; }
 inline void MarkInterned(TDAttributeImp& attribute) { attribute.MarkInterned(); }
+
+// A new writable descriptor of class `Imp` labelled with the zero-terminated `name` (no label
+// for a null or empty one); null when memory runs out.
+template <class Imp>
+TDImpPtr MakeNamedTD(const uint8_t* name) {
+  TDNameImpPtr label;
+  if (name != nullptr && name[0] != 0) {
+    label = TDNameImp::Make(name, std::strlen(reinterpret_cast<const char*>(name)));
+    if (!label) return TDImpPtr();
+  }
+  return MakeCounted<Imp>(label, TDTypedefImpPtr());
+}

@@ -62,31 +62,13 @@ int32_t CompareElements(const TDSingleContainerImp& mine, const TDImp* source, i
   return a->CmpTDCommon(b, flags & ~kCmpFlagSecondPass);
 }
 
-template <class Imp>
-TDImpPtr MakeNamed(const uint8_t* name) {
-  TDNameImpPtr label;
-  if (name != nullptr && name[0] != 0) {
-    label = TDNameImp::Make(name, std::strlen(reinterpret_cast<const char*>(name)));
-    if (!label) return TDImpPtr();
-  }
-  return MakeCounted<Imp>(label, TDTypedefImpPtr());
-}
 
-template <class Imp>
-class BlockFactory final : public TDTypeFactory {
- public:
-  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
-    TDImpPtr type = MakeCounted<Imp>();
-    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
-    return type;
-  }
-};
 
-BlockFactory<TDBlockImp> gBlockFactory;
-BlockFactory<TDAlignedBlockImp> gAlignedBlockFactory;
-BlockFactory<TDTypeBlockImp> gTypeBlockFactory;
-BlockFactory<TDVoidBlockImp> gVoidBlockFactory;
-BlockFactory<TDRepeatedBlockImp> gRepeatedBlockFactory;
+EmptyTypeFactory<TDBlockImp> gBlockFactory;
+EmptyTypeFactory<TDAlignedBlockImp> gAlignedBlockFactory;
+EmptyTypeFactory<TDTypeBlockImp> gTypeBlockFactory;
+EmptyTypeFactory<TDVoidBlockImp> gVoidBlockFactory;
+EmptyTypeFactory<TDRepeatedBlockImp> gRepeatedBlockFactory;
 
 // Announced as the library loads; the service registers them in these places at start.
 const bool gAnnounced = [] {
@@ -558,15 +540,15 @@ void TDRepeatedBlockImp::SetNumBlocks(uint32_t count) {
 
 bool SizedBlockKind::Admit(const TDImp& type) { return type.IsSizedBlock() != 0; }
 bool BlockKind::Admit(const TDImp& type) { return type.IsBlock() != 0; }
-TDImpPtr BlockKind::New(const uint8_t* name) { return MakeNamed<TDBlockImp>(name); }
+TDImpPtr BlockKind::New(const uint8_t* name) { return MakeNamedTD<TDBlockImp>(name); }
 bool AlignedBlockKind::Admit(const TDImp& type) { return type.IsAlignedBlock() != 0; }
-TDImpPtr AlignedBlockKind::New(const uint8_t* name) { return MakeNamed<TDAlignedBlockImp>(name); }
+TDImpPtr AlignedBlockKind::New(const uint8_t* name) { return MakeNamedTD<TDAlignedBlockImp>(name); }
 bool TypeBlockKind::Admit(const TDImp& type) { return type.IsTypeBlock() != 0; }
-TDImpPtr TypeBlockKind::New(const uint8_t* name) { return MakeNamed<TDTypeBlockImp>(name); }
+TDImpPtr TypeBlockKind::New(const uint8_t* name) { return MakeNamedTD<TDTypeBlockImp>(name); }
 bool VoidBlockKind::Admit(const TDImp& type) { return type.IsVoidBlock() != 0; }
-TDImpPtr VoidBlockKind::New(const uint8_t* name) { return MakeNamed<TDVoidBlockImp>(name); }
+TDImpPtr VoidBlockKind::New(const uint8_t* name) { return MakeNamedTD<TDVoidBlockImp>(name); }
 bool RepeatedBlockKind::Admit(const TDImp& type) { return type.IsRepeatedBlock() != 0; }
-TDImpPtr RepeatedBlockKind::New(const uint8_t* name) { return MakeNamed<TDRepeatedBlockImp>(name); }
+TDImpPtr RepeatedBlockKind::New(const uint8_t* name) { return MakeNamedTD<TDRepeatedBlockImp>(name); }
 
 namespace {
 

@@ -127,26 +127,9 @@ int32_t CopyBooleanForm(const TDImp& srcType, const TDImp& dstType, const void* 
 
 void ReportNotACluster() { DebugReport(__FILE__, __LINE__, 3, "CopyDataConvert:  destination is not a cluster!"); }
 
-template <class Imp>
-TDImpPtr MakeNamed(const uint8_t* name) {
-  TDNameImpPtr label;
-  if (name != nullptr && name[0] != 0) {
-    label = TDNameImp::Make(name, std::strlen(reinterpret_cast<const char*>(name)));
-    if (!label) return TDImpPtr();
-  }
-  return MakeCounted<Imp>(label, TDTypedefImpPtr());
-}
 
-class ClusterFactory final : public TDTypeFactory {
- public:
-  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
-    TDImpPtr type = MakeCounted<TDClusterImp>();
-    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
-    return type;
-  }
-};
 
-ClusterFactory gClusterFactory;
+EmptyTypeFactory<TDClusterImp> gClusterFactory;
 
 // Announced as the library loads; the service registers it in this place at start.
 const bool gAnnounced = [] {
@@ -538,7 +521,7 @@ const TDClusterImp* AsCluster(const TDImp* type) {
 }
 
 bool ClusterKind::Admit(const TDImp& type) { return type.IsClust() != 0; }
-TDImpPtr ClusterKind::New(const uint8_t* name) { return MakeNamed<TDClusterImp>(name); }
+TDImpPtr ClusterKind::New(const uint8_t* name) { return MakeNamedTD<TDClusterImp>(name); }
 
 namespace {
 

@@ -8,6 +8,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXStrings.h"
 #include "source/TDStringBase.h"
+#include "source/TDAttributes.h"
 #include "source/TypeManager.h"
 
 namespace {
@@ -42,20 +43,11 @@ int32_t ConvertPointer(const TDImp& self, const TDImp* dst, const void* src, voi
   return CopyPointer(src, dstData);
 }
 
-template <class Imp>
-class PlainFactory final : public TDTypeFactory {
- public:
-  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
-    TDImpPtr type = MakeCounted<Imp>();
-    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
-    return type;
-  }
-};
 
-PlainFactory<TDPtrToImp> gPtrToFactory;
-PlainFactory<TDPtrImp> gPtrFactory;
-PlainFactory<TDPStrImp> gPStrFactory;
-PlainFactory<TDCStrImp> gCStrFactory;
+EmptyTypeFactory<TDPtrToImp> gPtrToFactory;
+EmptyTypeFactory<TDPtrImp> gPtrFactory;
+EmptyTypeFactory<TDPStrImp> gPStrFactory;
+EmptyTypeFactory<TDCStrImp> gCStrFactory;
 
 // Announced as the library loads; the service registers them in this order at start.
 const bool gAnnounced = [] {
@@ -66,13 +58,6 @@ const bool gAnnounced = [] {
   return true;
 }();
 
-template <class Imp>
-TDImpPtr MakeNamed(const uint8_t* name) {
-  bool failed = false;
-  TDNameImpPtr label = MakeNameFromCStr(name, &failed);
-  if (failed) return TDImpPtr();
-  return TDImpPtr(MakeCounted<Imp>(label, TDTypedefImpPtr()));
-}
 
 }  // namespace
 
@@ -104,10 +89,10 @@ int32_t TDPtrToImp::CopyDataConvertCore(const TDImp* dst, const void* src, void*
 }
 
 bool CStrKind::Admit(const TDImp& type) { return type.IsCStr() != 0; }
-TDImpPtr CStrKind::New(const uint8_t* name) { return MakeNamed<TDCStrImp>(name); }
+TDImpPtr CStrKind::New(const uint8_t* name) { return MakeNamedTD<TDCStrImp>(name); }
 bool PStrKind::Admit(const TDImp& type) { return type.IsPStr() != 0; }
-TDImpPtr PStrKind::New(const uint8_t* name) { return MakeNamed<TDPStrImp>(name); }
+TDImpPtr PStrKind::New(const uint8_t* name) { return MakeNamedTD<TDPStrImp>(name); }
 bool PtrKind::Admit(const TDImp& type) { return type.IsPtr() != 0; }
-TDImpPtr PtrKind::New(const uint8_t* name) { return MakeNamed<TDPtrImp>(name); }
+TDImpPtr PtrKind::New(const uint8_t* name) { return MakeNamedTD<TDPtrImp>(name); }
 bool PtrToKind::Admit(const TDImp& type) { return type.IsPtrTo() != 0; }
-TDImpPtr PtrToKind::New(const uint8_t* name) { return MakeNamed<TDPtrToImp>(name); }
+TDImpPtr PtrToKind::New(const uint8_t* name) { return MakeNamedTD<TDPtrToImp>(name); }

@@ -11,29 +11,11 @@
 
 namespace {
 
-template <class Imp>
-TDImpPtr MakeNamed(const uint8_t* name) {
-  TDNameImpPtr label;
-  if (name != nullptr && name[0] != 0) {
-    label = TDNameImp::Make(name, std::strlen(reinterpret_cast<const char*>(name)));
-    if (!label) return TDImpPtr();
-  }
-  return MakeCounted<Imp>(label, TDTypedefImpPtr());
-}
 
-template <class Imp>
-class SimpleFactory final : public TDTypeFactory {
- public:
-  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
-    TDImpPtr type = MakeCounted<Imp>();
-    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
-    return type;
-  }
-};
 
-SimpleFactory<TDVoidImp> gVoidFactory;
-SimpleFactory<TDBooleanImp> gBooleanFactory;
-SimpleFactory<TDBooleanU16Imp> gBooleanU16Factory;
+EmptyTypeFactory<TDVoidImp> gVoidFactory;
+EmptyTypeFactory<TDBooleanImp> gBooleanFactory;
+EmptyTypeFactory<TDBooleanU16Imp> gBooleanU16Factory;
 
 // Announced as the library loads; the service registers them in this order at start.
 const bool gAnnounced = [] {
@@ -135,11 +117,11 @@ void TDBooleanU16Imp::Accept(ITDVisitor* visitor) {
 }
 
 bool VoidKind::Admit(const TDImp& type) { return type.IsVoid() != 0; }
-TDImpPtr VoidKind::New(const uint8_t* name) { return MakeNamed<TDVoidImp>(name); }
+TDImpPtr VoidKind::New(const uint8_t* name) { return MakeNamedTD<TDVoidImp>(name); }
 bool BooleanKind::Admit(const TDImp& type) { return type.IsBool() != 0; }
-TDImpPtr BooleanKind::New(const uint8_t* name) { return MakeNamed<TDBooleanImp>(name); }
+TDImpPtr BooleanKind::New(const uint8_t* name) { return MakeNamedTD<TDBooleanImp>(name); }
 bool BooleanU16Kind::Admit(const TDImp& type) { return type.IsBoolU16() != 0; }
-TDImpPtr BooleanU16Kind::New(const uint8_t* name) { return MakeNamed<TDBooleanU16Imp>(name); }
+TDImpPtr BooleanU16Kind::New(const uint8_t* name) { return MakeNamedTD<TDBooleanU16Imp>(name); }
 
 int32_t TDWBoolean::SetEventDiscardMask(int32_t mask) {
   if (!imp_) return kStatusNullHandle;

@@ -180,20 +180,11 @@ int32_t StringKindCmpTD(const TDStringBaseImp& self, const TDImp* source, int32_
   return result | StringBoundCmpBits(self.GetBound(), BoundOfStringBase(source), flags);
 }
 
-template <class Imp>
-class StringBaseFactory final : public TDTypeFactory {
- public:
-  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
-    TDImpPtr type = MakeCounted<Imp>();
-    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
-    return type;
-  }
-};
 
-StringBaseFactory<TDStringImp> gStringFactory;
-StringBaseFactory<TDPictImp> gPictFactory;
-StringBaseFactory<TDPathImp> gPathFactory;
-StringBaseFactory<TDSubStringImp> gSubStringFactory;
+EmptyTypeFactory<TDStringImp> gStringFactory;
+EmptyTypeFactory<TDPictImp> gPictFactory;
+EmptyTypeFactory<TDPathImp> gPathFactory;
+EmptyTypeFactory<TDSubStringImp> gSubStringFactory;
 
 // Announced as the library loads; the service registers them in this order at start.
 const bool gAnnounced = [] {

@@ -43,16 +43,8 @@ int32_t CompareClasses(const uint8_t* a, const uint8_t* b) {
   return PStrCmp(a != nullptr ? a : EmptyPStr(), b != nullptr ? b : EmptyPStr());
 }
 
-class TDTagFactory final : public TDTypeFactory {
- public:
-  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
-    TDImpPtr type = MakeCounted<TDTagImp>();
-    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
-    return type;
-  }
-};
 
-TDTagFactory gTagFactory;
+EmptyTypeFactory<TDTagImp> gTagFactory;
 
 // Announced as the library loads; the service registers it in its place at start.
 const bool gAnnounced = [] {

@@ -20,6 +20,17 @@ class TDTypeFactory {
   virtual TDImpPtr CreateUnflattenHandler(int16_t typeCode) const;
 };
 
+// The factory of a kind whose descriptors start empty and are filled by their ConstructTD.
+template <class Imp>
+class EmptyTypeFactory final : public TDTypeFactory {
+ public:
+  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
+    TDImpPtr type = MakeCounted<Imp>();
+    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
+    return type;
+  }
+};
+
 // Stores a factory for a code (0 to 255; others are refused with a message). Replacing one
 // reports the re-registration and goes on.
 void RegisterTypeFactory(uint16_t typeCode, TDTypeFactory* factory);

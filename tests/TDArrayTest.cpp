@@ -255,6 +255,27 @@ TEST_F(TDArrayTest, IdentityHashAndSharedVectors) {
   EXPECT_EQ(vector.ConvertToSubArray().IsSubType(), 1);
 }
 
+TEST_F(TDArrayTest, FactoriesWalksAndMarksReachTheElement) {
+  for (const TypeCode code : {TypeCode::Array, TypeCode::SubArray, TypeCode::ArrayDataPtr}) {
+    EXPECT_NE(GetTypeFactory(static_cast<int32_t>(code)), nullptr);
+  }
+  TDWArray array(2, GetiL());
+  EXPECT_EQ(array.EphemeralizeTD(), 0);
+  EXPECT_EQ(TDRArray(array.CheckIn().GetImpPtr(), 1).GetEltTD().IsEphemeralTD(), 4);
+  int32_t visited = 0;
+  array.CheckIn().TraverseTDR(
+      [](const TDR& type, void* context) {
+        *static_cast<int32_t*>(context) += type.GetTypeCode();
+        return kTraverseContinue;
+      },
+      &visited, nullptr);
+  EXPECT_EQ(visited, 0x40 + 0x03);
+  TDW generic = GetiL().CheckOut();
+  generic.SetGenericness(1);
+  EXPECT_EQ(TDRArray(1, generic.CheckIn()).IsSemiGeneric(), 1);
+  EXPECT_EQ(TDRArray(1, GetiL()).IsArrayFloat64Wfms(), 0);
+}
+
 TEST_F(TDArrayTest, MutateBooleanThroughArrays) {
   TDWArray array(1, GetBoolTD());
   TDW handle = array;
@@ -465,6 +486,9 @@ TEST_F(TDArrayTest, FlatAndElementwiseCopies) {
   ASSERT_EQ(ints.CopyData(from.Slot(), into.Slot(), nullptr, 0), kStatusNoError);
   EXPECT_EQ(into.Bytes(), from.Bytes());
   EXPECT_NE(into.H(), from.H());
+  Datum row(GetLong1DTD());
+  ASSERT_EQ(VectorResizeTDR(GetiL(), row.Slot(), from.H()), kStatusNoError);
+  EXPECT_EQ(row.Bytes(), Block({2}, 8));
   UHandle none = nullptr;
   ASSERT_EQ(ints.CopyData(&none, into.Slot(), nullptr, 0), kStatusNoError);
   EXPECT_EQ(into.H(), nullptr);
@@ -488,6 +512,30 @@ TEST_F(TDArrayTest, FlatAndElementwiseCopies) {
     strings.DeflateData(&h, &h + 1, 1, NormalHandleAllocator());
     return status;
   });
+  // Element by element through the conversion dispatch: the descriptors differ by a name.
+  TDWArray named(1, GetStringTD());
+  named.SetName(std::string("named"));
+  const TDR other = named.CheckIn();
+  SweepAllocationFailures(kStatusOutOfMemory, [&] {
+    UHandle h = nullptr;
+    const int32_t status = strings.CopyDataConvert(other, text.Slot(), &h, 0);
+    if (status == kStatusNoError) {
+      EXPECT_EQ(strings.VerifyData(&h, nullptr), kStatusNoError);
+    }
+    other.DeflateData(&h, &h + 1, 1, NormalHandleAllocator());
+    return status;
+  });
+
+  // The exported flat copy refuses a block smaller than its dimension words say.
+  UHandle h = nullptr;
+  EXPECT_EQ(CopyFlatArray(8, from.H(), &h, 2, 4), kStatusNoError);
+  EXPECT_EQ(DSGetHandleSize(h), 32u);
+  reinterpret_cast<int32_t*>(*from.H())[0] = 3;
+  DebugCapture capture;
+  EXPECT_EQ(CopyFlatArray(8, from.H(), &h, 2, 4), kStatusBadArgument);
+  EXPECT_TRUE(capture.Contains("Array block smaller than its dimension sizes"));
+  EXPECT_EQ(CopyFlatArray(8, nullptr, &h, 2, 4), kStatusNoError);
+  EXPECT_EQ(h, nullptr);
 }
 
 TEST_F(TDArrayTest, PreallocatedCopiesRefuseWrongSizes) {
@@ -643,6 +691,10 @@ TEST_F(TDArrayTest, ViewsIntoSubArraysAndBack) {
 }
 
 TEST_F(TDArrayTest, ArrayDataPtrIsNeverCopiedAsAValue) {
+  const TDR fixedString = TDRString(nullptr, Fix(3));
+  EXPECT_EQ(MakeArray(fixedString, {Fix(2), Fix(3)}).GetImp()->IsFlatDataFixedSize(), 1);
+  EXPECT_EQ(MakeArray(fixedString, {Fix(2), 3}).GetImp()->IsFlatDataFixedSize(), 0);
+  EXPECT_EQ(MakeArray(GetStringTD(), {Fix(2)}).GetImp()->IsFlatDataFixedSize(), 0);
   const TDRArrayDataPtr pointer(1, GetiL());
   EXPECT_EQ(pointer.DataSize(), 8);
   EXPECT_EQ(pointer.DataShape(), kDataShapePlain);
@@ -656,6 +708,7 @@ TEST_F(TDArrayTest, ArrayDataPtrIsNeverCopiedAsAValue) {
 // --- bad input -----------------------------------------------------------------------------------
 
 TEST_F(TDArrayTest, VerifyDataFindsDamage) {
+  DebugCapture capture;
   SetTDRaveProc(&Rave);
   const TDRArray ints = MakeArray(GetiL(), {kVar, kVar});
   Datum datum(ints);
@@ -704,7 +757,6 @@ TEST_F(TDArrayTest, VerifyDataFindsDamage) {
   ASSERT_EQ(StringUtils::ToLStr("abc", &s), kStatusNoError);
   (*s)->cnt = 100;
   text.Set<LStrHandle>(4, 1, s);
-  DebugCapture capture;
   EXPECT_EQ(strings.VerifyData(text.Slot(), nullptr), 1024);
   EXPECT_TRUE(capture.Contains(", eltOffset=12"));
   (*s)->cnt = 3;
