@@ -4,9 +4,12 @@
 
 #include <algorithm>
 #include <cstring>
+#include <mutex>
 #include <new>
+#include <unordered_set>
 
 #include "runtime/BinData.h"
+#include "runtime/PXInternal.h"
 #include "runtime/PXStrings.h"
 
 namespace {
@@ -17,6 +20,25 @@ constexpr uint32_t kCountedHeaderBytes = 4;  // type and component count, inside
 
 bool IsKnownType(int32_t type) { return type >= kAbsPath && type <= kUNCPath; }
 
+// Every live path, so that a stray pointer handed in as a path is recognised without being read
+// (data verification meets paths in memory it did not make).
+struct LivePaths {
+  std::mutex mutex;  // guards paths
+  std::unordered_set<const PathRef*> paths;
+};
+
+LivePaths& TheLivePaths() {
+  static pxinternal::NoDestructor<LivePaths> live;
+  return live.get();
+}
+
+bool IsLive(const PathRef* p) {
+  if (!p) return false;
+  LivePaths& live = TheLivePaths();
+  std::lock_guard lock(live.mutex);
+  return live.paths.count(p) != 0;
+}
+
 int32_t NewPath(int32_t type, Path* out) {
   if (!out) return kStatusBadArgument;
   *out = nullptr;
@@ -24,6 +46,15 @@ int32_t NewPath(int32_t type, Path* out) {
   if (!block) return kStatusOutOfMemory;
   Path p = ::new (block) PathRef();
   p->type = type;
+  try {
+    LivePaths& live = TheLivePaths();
+    std::lock_guard lock(live.mutex);
+    live.paths.insert(p);
+  } catch (const std::bad_alloc&) {
+    p->~PathRef();
+    PXFree(p);
+    return kStatusOutOfMemory;
+  }
   *out = p;
   return kStatusNoError;
 }
@@ -107,7 +138,7 @@ int32_t FPathCmp(Path a, Path b) { return ComparePaths(a, b, &PathRef::NameCompa
 int32_t FPathCmpExact(Path a, Path b) { return ComparePaths(a, b, &ExactCompare); }
 
 int32_t FIsSanePath(Path p) {
-  if (!p || !IsKnownType(p->type)) return 0;
+  if (!IsLive(p) || !IsKnownType(p->type)) return 0;
   if (p->type == kNotAPath && !p->names.empty()) return 0;
   if (p->names.size() > static_cast<size_t>(kMaxPathDepth)) return 0;
   for (const PathRef::Name& n : p->names)
@@ -134,6 +165,12 @@ int32_t FPathCopy(Path src, Path* dst) {
 int32_t FDestroyPath(Path* p) {
   if (!p) return kStatusBadArgument;
   if (Path path = *p) {
+    {
+      LivePaths& live = TheLivePaths();
+      std::lock_guard lock(live.mutex);
+      // Not a path this layer made, or one already destroyed: leave the memory alone.
+      if (live.paths.erase(path) == 0) return kStatusBadArgument;
+    }
     *p = nullptr;
     path->~PathRef();
     PXFree(path);

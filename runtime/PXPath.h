@@ -64,11 +64,13 @@ int32_t FSetPathType(Path p, int32_t type);
 int32_t FPathCmp(Path a, Path b);
 // The same order with component names compared byte for byte.
 int32_t FPathCmpExact(Path a, Path b);
-// 1 when p has a known type, valid names, and no names if it is a not-a-path; else 0.
+// 1 when p is a live path made here with a known type, valid names, and no names if it is a
+// not-a-path; else 0. A pointer that is not a live path is never read.
 int32_t FIsSanePath(Path p);
 // *dst is a new copy of src (null for a null src). On failure *dst is null (2).
 int32_t FPathCopy(Path src, Path* dst);
-// Frees *p and sets it null. A null *p is fine; a null p is 1.
+// Frees *p and sets it null. A null *p is fine; a null p, or a *p that is not a live path made
+// here (already destroyed, or garbage), is 1 and nothing is touched.
 int32_t FDestroyPath(Path* p);
 
 // Writes p in the flattened form; a null path is written as a not-a-path. Errors go to the

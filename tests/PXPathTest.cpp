@@ -3,6 +3,7 @@
 
 #include <gtest/gtest.h>
 
+#include <cstring>
 #include <memory>
 #include <string>
 #include <vector>
@@ -264,3 +265,21 @@ TEST(PXPathTest, FailureSweepOverPathBuilding) {
 }
 
 }  // namespace
+
+// Data verification meets path pointers in memory the library did not write: a pointer that is
+// not a live path is refused without being read, and a path is never freed twice.
+TEST(PXPathTest, OnlyLivePathsAreReadOrFreed) {
+  LiveBlockCheck blocks;
+  Path path = nullptr;
+  ASSERT_EQ(FEmptyPath(&path), kStatusNoError);
+  EXPECT_EQ(FIsSanePath(path), 1);
+  Path stale = path;
+  EXPECT_EQ(FDestroyPath(&path), kStatusNoError);
+  EXPECT_EQ(FIsSanePath(stale), 0);
+  EXPECT_EQ(FDestroyPath(&stale), kStatusBadArgument);
+  alignas(16) unsigned char garbage[64];
+  std::memset(garbage, 0xA5, sizeof(garbage));
+  Path fake = reinterpret_cast<Path>(garbage);
+  EXPECT_EQ(FIsSanePath(fake), 0);
+  EXPECT_EQ(FDestroyPath(&fake), kStatusBadArgument);
+}
