@@ -18,5 +18,7 @@
 #include "vellum/TDUnitsHandles.h"
 #include "vellum/TDUtility.h"
 #include "vellum/TDVisitor.h"
+#include "vellum/TMTypeList.h"
 #include "vellum/TypeCodes.h"
 #include "vellum/TypeManagerHooks.h"
+#include "vellum/TypeNotation.h"
