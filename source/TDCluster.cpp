@@ -12,8 +12,10 @@
 #include "runtime/DebugStream.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXStrings.h"
+#include "source/MoveBytes.h"
 #include "source/TDAttributes.h"
 #include "source/TDDataManager.h"
+#include "source/TDStringBase.h"
 #include "source/TypeManager.h"
 
 namespace {
@@ -286,6 +288,7 @@ int32_t TDClusterImp::MemberCheckIn(TDImpPtr& target) const {
 int32_t TDClusterImp::RecordLayout() {
   const int32_t dsAlign = GetDSAlign();
   layoutDSAlign_ = -1;
+  plainDataSize_ = -1;
   offsets_.clear();
   steps_.clear();
   try {
@@ -298,7 +301,9 @@ int32_t TDClusterImp::RecordLayout() {
       const TDImp* element = cursor.Element();
       if (element == nullptr || end == offset) continue;
       if (element->DataShapeOf(1) != kDataShapePlain) {
-        steps_.push_back(DataStep{element, offset, end - offset});
+        const auto* text = dynamic_cast<const TDStringImp*>(element);
+        const bool variableString = text != nullptr && vellum::bound::IsVariable(text->GetBound());
+        steps_.push_back(DataStep{element, offset, end - offset, variableString});
       } else if (!steps_.empty() && steps_.back().element == nullptr) {
         // Bytes next to bytes (padding between them included) move as one run.
         steps_.back().size = end - steps_.back().offset;
@@ -311,6 +316,9 @@ int32_t TDClusterImp::RecordLayout() {
     steps_.clear();
     return kStatusOutOfMemory;
   }
+  const bool handles =
+      std::any_of(steps_.begin(), steps_.end(), [](const DataStep& step) { return step.element != nullptr; });
+  if (!handles) plainDataSize_ = DataSizeCore(nullptr);
   layoutDSAlign_ = dsAlign;
   return kStatusNoError;
 }
@@ -414,6 +422,28 @@ int32_t TDClusterImp::VerifyData(const void* data, const KoContext* context) con
 
 int32_t TDClusterImp::CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const {
   if (src == nullptr || dst == nullptr) return kStatusBadArgument;
+  if ((flags & kCopyFlagBooleanForm) != 0 || !HasRecordedLayout()) return CopyDataWalk(src, dst, flags, context);
+  // The interned cluster's copy plan: runs of plain bytes and the handle-bearing elements' own
+  // copy slots, with no descriptor walk.
+  if (plainDataSize_ >= 0) {
+    MoveBytes(dst, src, static_cast<size_t>(plainDataSize_));
+    return kStatusNoError;
+  }
+  for (const DataStep& s : steps_) {
+    void* into = At(dst, s.offset);
+    const void* from = At(src, s.offset);
+    if (s.element == nullptr) {
+      MoveBytes(into, from, static_cast<size_t>(s.size));
+      continue;
+    }
+    if (s.variableString && MoveSameLengthLStr(from, into)) continue;
+    const int32_t status = s.element->CopyData(from, into, flags, context);
+    if (status != kStatusNoError) return status;
+  }
+  return kStatusNoError;
+}
+
+int32_t TDClusterImp::CopyDataWalk(const void* src, void* dst, int32_t flags, const KoContext* context) const {
   if ((flags & kCopyFlagBooleanForm) != 0) {
     TDImpPtr mutated = CloneOrCheckOut();
     if (!mutated) return kStatusOutOfMemory;

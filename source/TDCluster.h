@@ -64,9 +64,14 @@ class TDClusterImp : public TDMultiContainerImp {
     const TDImp* element;
     int32_t offset;
     int32_t size;
+    // A variable String, whose same-length copy is made here without a call.
+    bool variableString = false;
   };
 
   int32_t RecordLayout();
+  // CopyData without the recorded copy plan: the Boolean-form copy, and clusters that are not
+  // interned or whose layout no longer holds. Kept out of line so the planned copy stays small.
+  [[gnu::noinline]] int32_t CopyDataWalk(const void* src, void* dst, int32_t flags, const KoContext* context) const;
   bool HasRecordedLayout() const { return layoutDSAlign_ >= 0 && layoutDSAlign_ == GetDSAlign(); }
   // Calls `step(element or null, offset, size)` over the datum in order while it returns 0; the
   // first other status.
@@ -78,6 +83,8 @@ class TDClusterImp : public TDMultiContainerImp {
   int32_t layoutDSAlign_ = -1;
   std::vector<int32_t, PXAllocator<int32_t>> offsets_;
   std::vector<DataStep, PXAllocator<DataStep>> steps_;
+  // The whole datum's size when no element holds handles (copied as one block); -1 otherwise.
+  int32_t plainDataSize_ = -1;
   // Layout facts of the running process, kept only by interned clusters (which never change).
   // A size or alignment entry records the SetDSAlign value it was computed with and is used only
   // while that value holds; 0 means no entry.

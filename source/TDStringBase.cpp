@@ -15,6 +15,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXStrings.h"
+#include "source/MoveBytes.h"
 #include "source/TDAttributes.h"
 #include "source/TDDataManager.h"
 #include "source/TypeManager.h"
@@ -476,6 +477,7 @@ int32_t TDStringBaseImp::ShrinkData(void* data, void* end, int32_t flag,
 
 int32_t TDStringBaseImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {
   if (src == nullptr || dst == nullptr) return kStatusBadArgument;
+  if (IsVariable(GetBound()) && MoveSameLengthLStr(src, dst)) return kStatusNoError;
   return CopyIntoLStrData(*this, Load<LStrHandle>(src), dst);
 }
 
