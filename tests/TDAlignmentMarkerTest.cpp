@@ -22,7 +22,6 @@ class TDAlignmentMarkerTest : public TypeSystemTest {
   }
 };
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
 class IdentifiedPlatform final : public ITargetPlatformAlignment {
  public:

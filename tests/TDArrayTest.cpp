@@ -98,18 +98,6 @@ void Rave(void*, void*, int32_t& status, int32_t code) {
   status = code;
 }
 
-class Platform final : public ITargetPlatformAlignment {
- public:
-  explicit Platform(int32_t pointerSize) : pointer_(pointerSize) {}
-  int32_t MaxAlignment() const override { return pointer_; }
-  int32_t AggregateAlignmentMode() const override { return 0; }
-  int32_t PointerSize() const override { return pointer_; }
-  int32_t IsBigEndian() const override { return 0; }
-  int32_t NumericSize(int32_t typeCode) const override { return NumSize(typeCode); }
-
- private:
-  int32_t pointer_;
-};
 
 // --- counting ------------------------------------------------------------------------------------
 
@@ -684,7 +672,7 @@ TEST_F(TDArrayTest, ViewsIntoSubArraysAndBack) {
   EXPECT_EQ(view.GetStrideOffset(1), 32);
   EXPECT_EQ(view.GetStrideOffset(2), 0);
   EXPECT_TRUE(capture.Contains(" Invalid dimension"));
-  Platform small(4);
+  TestPlatform small(4, 0, 4);
   EXPECT_EQ(view.GetDimSizeOffset(1, &small), 12);
   EXPECT_EQ(view.GetStrideOffset(1, &small), 16);
   EXPECT_EQ(view.DataSize(&small), 20);

@@ -34,23 +34,7 @@ class TDClusterTest : public TypeSystemTest {
   }
 };
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
-class TestPlatform final : public ITargetPlatformAlignment {
- public:
-  TestPlatform(int32_t maxAlignment, int32_t aggregateMode, int32_t pointerSize)
-      : max_(maxAlignment), aggregate_(aggregateMode), pointer_(pointerSize) {}
-  int32_t MaxAlignment() const override { return max_; }
-  int32_t AggregateAlignmentMode() const override { return aggregate_; }
-  int32_t PointerSize() const override { return pointer_; }
-  int32_t IsBigEndian() const override { return 0; }
-  int32_t NumericSize(int32_t typeCode) const override { return NumSize(typeCode); }
-
- private:
-  int32_t max_;
-  int32_t aggregate_;
-  int32_t pointer_;
-};
 
 TDW Named(const TDR& type, const char* name) {
   TDW copy = type.CheckOut();

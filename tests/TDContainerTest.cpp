@@ -18,7 +18,6 @@ namespace {
 
 using TDContainerTest = TypeSystemTest;
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
 TDW Named(const TDR& type, const char* name) {
   TDW copy = type.CheckOut();

@@ -16,7 +16,6 @@ namespace {
 
 class TDOtherTest : public TypeSystemTest {};
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
 class PointerPlatform final : public ITargetPlatformAlignment {
  public:

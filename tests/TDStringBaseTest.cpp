@@ -27,7 +27,6 @@ class TDStringBaseTest : public TypeSystemTest {
   }
 };
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 using Bytes = std::vector<uint8_t>;
 
 // One string datum that frees its handle.
@@ -55,19 +54,6 @@ Bytes Block(int32_t length, std::string_view bytes) {
 }
 
 // A target whose pointer size and largest alignment the test chooses.
-class TestPlatform final : public ITargetPlatformAlignment {
- public:
-  TestPlatform(int32_t maxAlignment, int32_t pointerSize) : max_(maxAlignment), pointer_(pointerSize) {}
-  int32_t MaxAlignment() const override { return max_; }
-  int32_t AggregateAlignmentMode() const override { return 0; }
-  int32_t PointerSize() const override { return pointer_; }
-  int32_t IsBigEndian() const override { return 0; }
-  int32_t NumericSize(int32_t typeCode) const override { return NumSize(typeCode); }
-
- private:
-  int32_t max_;
-  int32_t pointer_;
-};
 
 TEST_F(TDStringBaseTest, KindsAndSharedDefaults) {
   struct Case {
@@ -511,7 +497,7 @@ TEST_F(TDStringBaseTest, LayoutForAnotherPlatform) {
   };
   for (const Case& c : kCases) {
     SCOPED_TRACE(c.name);
-    TestPlatform platform(c.maxAlignment, c.pointerSize);
+    TestPlatform platform(c.maxAlignment, 0, c.pointerSize);
     EXPECT_EQ(GetStringTD().DataSize(&platform), c.pointerSize);
     EXPECT_EQ(GetSubStringTD().GetAlignment(&platform), c.pointerSize);
     EXPECT_EQ(GetSubStringTD().DataSize(&platform), c.subStringSize);
@@ -523,7 +509,7 @@ TEST_F(TDStringBaseTest, LayoutForAnotherPlatform) {
   EXPECT_EQ(sub.GetLengthOffset(), 8);
   const TDRCluster record(GetSubStringRecTD().GetImpPtr(), 1);
   ASSERT_EQ(record.GetNumElts(), 3);
-  TestPlatform platform(8, 8);
+  TestPlatform platform(8, 0, 8);
   EXPECT_EQ(record.GetEltOffsetByName(U("stride"), &platform), 16);
 }
 

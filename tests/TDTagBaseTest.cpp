@@ -22,7 +22,6 @@ class TDTagBaseTest : public TypeSystemTest {
   }
 };
 
-const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
 TEST_F(TDTagBaseTest, Kinds) {
   const TDRTag plain;

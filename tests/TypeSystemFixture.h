@@ -6,6 +6,7 @@
 
 #include "TestSupport.h"
 #include "runtime/DSMemory.h"
+#include "runtime/PXNumbers.h"
 #include "runtime/PXPath.h"
 #include "runtime/PXServices.h"
 #include "vellum.h"
@@ -43,3 +44,21 @@ inline TDWTypedef Link(const std::string& viName, uint32_t timeStamp, bool pathi
   FDestroyPath(&path);
   return link;
 }
+
+// A target platform for layout tests: its largest alignment, whether aggregates take it, and
+// its pointer size; numerics have this process's sizes.
+class TestPlatform final : public ITargetPlatformAlignment {
+ public:
+  TestPlatform(int32_t maxAlignment, int32_t aggregateMode, int32_t pointerSize)
+      : max_(maxAlignment), aggregate_(aggregateMode), pointer_(pointerSize) {}
+  int32_t MaxAlignment() const override { return max_; }
+  int32_t AggregateAlignmentMode() const override { return aggregate_; }
+  int32_t PointerSize() const override { return pointer_; }
+  int32_t IsBigEndian() const override { return 0; }
+  int32_t NumericSize(int32_t typeCode) const override { return NumSize(typeCode); }
+
+ private:
+  int32_t max_;
+  int32_t aggregate_;
+  int32_t pointer_;
+};
