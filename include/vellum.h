@@ -22,3 +22,4 @@
 #include "vellum/TypeCodes.h"
 #include "vellum/TypeManagerHooks.h"
 #include "vellum/TypeNotation.h"
+#include "vellum/TypeStrings.h"

@@ -88,6 +88,13 @@ int32_t OutputBuf::Write(const void* p, size_t n) {
   return kStatusNoError;
 }
 
+int32_t OutputBuf::Overwrite(size_t position, const void* p, size_t n) {
+  if (n == 0) return kStatusNoError;
+  if (p == nullptr || position > bytes_.size() || n > bytes_.size() - position) return kStatusBadArgument;
+  std::memcpy(bytes_.data() + position, p, n);
+  return kStatusNoError;
+}
+
 size_t OutputBuf::GetBytesWritten() const { return bytes_.size(); }
 
 std::vector<uint8_t> OutputBuf::Bytes() const { return std::vector<uint8_t>(bytes_.begin(), bytes_.end()); }

@@ -67,6 +67,9 @@ class OutputBuf {
   virtual int32_t Write(const void* p, size_t n);
   virtual size_t GetBytesWritten() const;
   virtual bool IsCounting() const { return false; }
+  // Replaces n bytes written earlier, from `position` on; 1 when they were not all written yet
+  // (a counting buffer accepts any).
+  virtual int32_t Overwrite(size_t position, const void* p, size_t n);
   const uint8_t* Data() const { return bytes_.data(); }
   std::vector<uint8_t> Bytes() const;
   // Copies the bytes into *out: a null or non-live *out gets a new handle, a live one is resized.
@@ -83,6 +86,7 @@ class PreflightOutputBuf : public OutputBuf {
   int32_t Write(const void* p, size_t n) override;
   size_t GetBytesWritten() const override { return count_; }
   bool IsCounting() const override { return true; }
+  int32_t Overwrite(size_t, const void*, size_t) override { return 0; }
 
  private:
   size_t count_ = 0;

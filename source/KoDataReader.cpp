@@ -2,7 +2,9 @@
 // format being read, the persist context, options and the variable-size field.
 #include "source/KoDataReader.h"
 
+#include "runtime/DebugStream.h"
 #include "runtime/PXApp.h"
+#include "source/TD80ReadWrite.h"
 
 KoDataReader::KoDataReader(InputBuf* in, uint32_t version, const KoContext* context,
                            const Endianizer* endianizer, ReaderOptions options)
@@ -50,4 +52,51 @@ KoDataReader::VersionOverride::~VersionOverride() {
   if (!reader_) return;
   reader_->own_.SetVersion(savedOwnVersion_);
   reader_->persist_ = savedPersist_;
+}
+
+TDR KoDataReader::ReadTD() {
+  if (GetError() != kStatusNoError) return TDR();
+  if (GetVersion() < 0x08002184) {
+    const ReadOldTDProc readOld = GetReadOldTDProc();
+    if (readOld == nullptr) {
+      DebugReport(__FILE__, __LINE__, 4, "No callback to read old TD");
+      SetError(kStatusNullHandle);
+      return TDR();
+    }
+    return readOld(this);
+  }
+  const PersistTDData& persist = *GetPersistTDData();
+  if (persist.PersistingWithConsolidatedTypes()) {
+    int32_t reference = 0;
+    if (ReadVariableSizeField(&reference) != kStatusNoError) return TDR();
+    if (persist.DefersIndices()) {
+      persist.PushPendingIndex(static_cast<uint32_t>(reference));
+      return TDR();
+    }
+    const TMTypeList* shared = persist.GetTypeList();
+    if (shared == nullptr || reference <= 0) return TDR();
+    return shared->GetType(static_cast<uint32_t>(reference - 1));
+  }
+  // The nested reader reads from this reader's input; its failures become this reader's.
+  TDDataReader types(&persist, GetInputBuf(), GetEndianizer(), GetOptions());
+  uint32_t records = 0;
+  types.ReadU32(&records);
+  if (types.GetError() == kStatusNoError) types.ReserveTDLoadTable(records);
+  for (uint32_t r = 0; r < records && types.GetError() == kStatusNoError; ++r)
+    if (!types.ConstructEltTD() && types.GetError() == kStatusNoError) types.SetError(kStatusCorruptData);
+  int32_t entries = 0;
+  types.ReadVariableSizeField(&entries);
+  TDR result;
+  if (types.GetError() == kStatusNoError) {
+    if (entries == 1) {
+      result = types.GetTypeRef();
+    } else if (entries != 0) {
+      types.SetError(kStatusCorruptData);
+    }
+  }
+  if (types.GetError() != kStatusNoError) {
+    SetError(types.GetError());
+    return TDR();
+  }
+  return result;
 }

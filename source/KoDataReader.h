@@ -42,6 +42,10 @@ class KoDataReader : public BinDataReader {
   // ((first & 0x7FFF) << 16) | second. `value` may be null to skip the field; on failure it is 0.
   int32_t ReadVariableSizeField(int32_t* value);
 
+  // A descriptor inside data, as WriteTD wrote it; the null descriptor on failure (or for a
+  // string with no entry). More than one entry is 74.
+  TDR ReadTD();
+
   // Reads with `version` for as long as it lives (nested readers made from the reader's context
   // see it too), then restores the version and context the reader had. Overrides nest; they
   // must end in reverse order of their creation, which scoping gives.

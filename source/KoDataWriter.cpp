@@ -2,14 +2,95 @@
 // writer that adds a version, that context and options to the runtime's binary writer.
 #include "source/KoDataWriter.h"
 
+#include <deque>
+#include <mutex>
+
 #include "runtime/DebugStream.h"
 #include "runtime/PXApp.h"
+#include "source/KoCMutate.h"
+#include "vellum/TypeStrings.h"
 
 namespace {
 
 constexpr int32_t kLargestShortSizeField = 0x7FFF;
 
+// Descriptors inside data of older versions belong to the host's old-format procedures.
+constexpr uint32_t kVariantVersionWordVersion = 0x08002184;
+// Consolidated types were first written by this version.
+constexpr uint32_t kConsolidatedTypesVersion = 0x08602039;
+// Versions before this one wrote consolidated references with consolidation suppressed.
+constexpr uint32_t kSuppressedConsolidationVersion = 0x08604005;
+
 }  // namespace
+
+struct PersistTDData::PendingQueue {
+  std::mutex mutex;
+  std::deque<uint32_t> indices;
+};
+
+PersistTDData::PersistTDData(uint32_t version, const KoContext* context, PersistTDDataOptions options)
+    : context_(context), version_(version), apiVersion_(PXApp::Instance().GetVersion()), options_(options) {
+  Init();
+}
+
+PersistTDData::PersistTDData(TMTypeList* typeList, const KoContext* context, uint32_t version,
+                             PersistTDDataOptions options, uint32_t apiVersion)
+    : context_(context),
+      version_(version),
+      apiVersion_(apiVersion != 0 ? apiVersion : PXApp::Instance().GetVersion()),
+      options_(options) {
+  if (version_ > apiVersion_) DebugReport(__FILE__, __LINE__, 3, "The API version should be passed to KoDataWriter");
+  Init();
+  SetTypeList(typeList);
+}
+
+void PersistTDData::Init() {
+  consolidationEnabled_ = !VersionShouldMutate(version_, kConsolidatedTypesVersion, apiVersion_);
+  if (DefersIndices() && !pending_) pending_ = std::make_shared<PendingQueue>();
+}
+
+void PersistTDData::SetVersion(uint32_t version) {
+  version_ = version;
+  consolidationEnabled_ = !VersionShouldMutate(version_, kConsolidatedTypesVersion, apiVersion_);
+}
+
+bool PersistTDData::PersistingWithConsolidatedTypes() const {
+  if (!consolidationEnabled_ || (options_ & kPersistSuppressConsolidation) != 0) return false;
+  return typeList_ != nullptr || (options_ & (kPersistDeferIndices | kPersistDropSharedList)) != 0;
+}
+
+bool PersistTDData::VersionUsedSuppressedConsolidatedTypes() const {
+  return VersionShouldMutate(version_, kSuppressedConsolidationVersion, apiVersion_);
+}
+
+void PersistTDData::SetTypeList(TMTypeList* typeList) {
+  if (consolidationEnabled_ && (options_ & kPersistDropSharedList) == 0) typeList_ = typeList;
+}
+
+void PersistTDData::LogSaveForPrevWarning(int32_t code) const {
+  if (sink_ != nullptr) sink_->LogSaveForPrevWarning(code);
+}
+
+bool PersistTDData::PushPendingIndex(uint32_t index) const {
+  if (!pending_) return false;
+  const std::lock_guard<std::mutex> lock(pending_->mutex);
+  pending_->indices.push_back(index);
+  return true;
+}
+
+bool PersistTDData::PopPendingIndex(uint32_t* index) const {
+  if (!pending_) return false;
+  const std::lock_guard<std::mutex> lock(pending_->mutex);
+  if (pending_->indices.empty()) return false;
+  *index = pending_->indices.front();
+  pending_->indices.pop_front();
+  return true;
+}
+
+const PersistTDData& GetPersistTDDataCurrentVersion() {
+  static const PersistTDData context(PXApp::Instance().GetVersion());
+  return context;
+}
 
 KoDataWriter::KoDataWriter(OutputBuf* out, uint32_t version, const Endianizer* endianizer,
                            KoDataWriterOptions options)
@@ -50,3 +131,26 @@ int32_t KoDataWriter::GetSizeOfVariableSizeField(int32_t value) {
 }
 
 int32_t KoDataWriter::WriteBool(bool value) { return WriteU8(value ? 1 : 0); }
+
+int32_t KoDataWriter::WriteTD(const TDR& type) {
+  if (GetError() != kStatusNoError) return GetError();
+  if (GetVersion() < kVariantVersionWordVersion) {
+    const WriteOldTDProc writeOld = GetWriteOldTDProc();
+    if (writeOld == nullptr) {
+      DebugReport(__FILE__, __LINE__, 4, "No callback to write old TD");
+      SetError(kStatusNullHandle);
+      return GetError();
+    }
+    writeOld(this, type);
+    return GetError();
+  }
+  UHandle flat = nullptr;
+  const int32_t status = FlattenOneType(GetPersistTDData(), type, &flat, GetEndianizer());
+  if (status != kStatusNoError) {
+    SetError(status);
+    return status;
+  }
+  WriteBytes(*flat, DSGetHandleSize(flat));
+  DSDisposeHandle(flat);
+  return GetError();
+}

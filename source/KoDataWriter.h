@@ -3,9 +3,11 @@
 #pragma once
 
 #include <cstdint>
+#include <memory>
 
 #include "runtime/BinData.h"
 #include "runtime/PXTypes.h"
+#include "vellum/TDHandles.h"
 
 // Options of one save or load. The bits are the ones a context keeps for consolidated types.
 using PersistTDDataOptions = uint32_t;
@@ -13,28 +15,70 @@ constexpr PersistTDDataOptions kPersistDropSharedList = 0x1;         // keep no 
 constexpr PersistTDDataOptions kPersistDeferIndices = 0x2;           // queue consolidated references
 constexpr PersistTDDataOptions kPersistSuppressConsolidation = 0x4;  // no consolidated types
 
+// Told when a save for an earlier version loses information; `code` says what was lost
+// (1: a fixed-point type saved as Float64).
+class IPersistWarningSink {
+ public:
+  virtual ~IPersistWarningSink() = default;
+  virtual void LogSaveForPrevWarning(int32_t code) = 0;
+};
+
+class TMTypeList;
+
 // The context of one save or load of descriptors and data: the version word being written or
-// read, the application context the descriptors belong to, and options. A small value; copies
-// are independent. The context pointer is carried along, never dereferenced or owned.
+// read, the application context the descriptors belong to, options, and for consolidated types
+// the shared type list and the queue of pending type indices. A small value: copies share the
+// caller's list, sink and queue, none of which the context owns (the queue is shared and lives
+// as long as its last copy). The context pointer is carried along, never dereferenced.
 class PersistTDData {
  public:
   static constexpr uint32_t kType = 0x44445450;
 
-  explicit PersistTDData(uint32_t version, const KoContext* context = nullptr,
-                         PersistTDDataOptions options = 0)
-      : context_(context), version_(version), options_(options) {}
+  explicit PersistTDData(uint32_t version, const KoContext* context = nullptr, PersistTDDataOptions options = 0);
+  // A context for consolidated types kept in `typeList` (not owned; it must outlive every copy).
+  // `apiVersion` 0 stands for the running application's version; a version above it is reported.
+  PersistTDData(TMTypeList* typeList, const KoContext* context, uint32_t version, PersistTDDataOptions options,
+                uint32_t apiVersion = 0);
 
   uint32_t GetType() const { return kType; }
   uint32_t GetVersion() const { return version_; }
-  void SetVersion(uint32_t version) { version_ = version; }
+  void SetVersion(uint32_t version);
   const KoContext* GetContext() const { return context_; }
   PersistTDDataOptions GetOptions() const { return options_; }
 
+  // Whether the version written or read knows consolidated types at all.
+  bool ConsolidationEnabled() const { return consolidationEnabled_; }
+  bool PersistingWithConsolidatedTypes() const;
+  bool VersionUsedSuppressedConsolidatedTypes() const;
+  bool DefersIndices() const { return (options_ & kPersistDeferIndices) != 0; }
+  TMTypeList* GetTypeList() const { return typeList_; }
+  // Takes the list only when consolidation is enabled and no shared list is to be dropped.
+  void SetTypeList(TMTypeList* typeList);
+
+  void SetWarningSink(IPersistWarningSink* sink) { sink_ = sink; }
+  void LogSaveForPrevWarning(int32_t code) const;
+
+  // The pending-index queue of deferred consolidated references: a reader pushes, a writer pops.
+  // Pop gives false when the queue is empty (or was never made: only deferring contexts have one).
+  bool PushPendingIndex(uint32_t index) const;
+  bool PopPendingIndex(uint32_t* index) const;
+
  private:
+  struct PendingQueue;
+  TMTypeList* typeList_ = nullptr;
   const KoContext* context_;
   uint32_t version_;
+  uint32_t apiVersion_;
   PersistTDDataOptions options_;
+  IPersistWarningSink* sink_ = nullptr;
+  bool consolidationEnabled_ = false;
+  std::shared_ptr<PendingQueue> pending_;
+
+  void Init();
 };
+
+// A process-wide context for the running application's version, built once.
+const PersistTDData& GetPersistTDDataCurrentVersion();
 
 using KoDataWriterOptions = uint32_t;
 // The writer only determines sizes; no data exist to be written.
@@ -81,6 +125,10 @@ class KoDataWriter : public BinDataWriter {
 
   // One byte, 1 for true and 0 for false.
   int32_t WriteBool(bool value);
+
+  // A descriptor inside data: its one-entry type string (the host's writer for versions before
+  // 0x08002184). The flattening's status becomes the stream's.
+  int32_t WriteTD(const TDR& type);
 
  private:
   KoDataWriterOptions options_;

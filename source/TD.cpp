@@ -9,6 +9,7 @@
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
 #include "source/CoreTDTable.h"
+#include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
 #include "vellum/TDVisitor.h"
@@ -126,11 +127,166 @@ int32_t TDImp::UnephemeralizeTD(int32_t queryOnly) {
   return old;
 }
 
-int32_t TDImp::GetFlatSizeForSaving(int32_t*, TDDataWriter*, int32_t*) const { return kStatusNullHandle; }
+// --- type strings ----------------------------------------------------------------------------------
 
-int32_t TDImp::FlattenTDForSaving(TDDataWriter*, int32_t*) const { return kStatusNullHandle; }
+namespace {
 
-int32_t TDImp::ConstructTD(TDDataReader*) { return kStatusNullHandle; }
+// The 16-bit word that announces a typedef link in a record.
+constexpr uint16_t kTypedefMarker = 0x00F1;
+// From this version on, the inner size of a typedef record leaves out the bytes of the typedef
+// part as written; before it, those of the one-name layout that preceded qualified names.
+constexpr uint32_t kInnerSizeVersion = 0x08608002;
+// The generic flag reached the record in this version.
+constexpr uint32_t kGenericFlagVersion = 0x09002000;
+// Fixed point did not exist before this version; it is saved as Float64 for older ones.
+constexpr uint32_t kFixedPointVersion = 0x08208003;
+constexpr int32_t kLargestShortField = 0x7FFF;
+
+int32_t TypedefPartSize(const TDTypedefImp& link, const TDDataWriter& writer) {
+  int32_t size = 0;
+  link.AddFlatSize(&size, &writer);
+  return size - 4;  // AddFlatSize counts the marker and the inner size too
+}
+
+// What the inner size of a typedef record leaves out.
+int32_t InnerSizeDeduction(const TDTypedefImp& link, const TDDataWriter& writer) {
+  if (writer.GetVersion() >= kInnerSizeVersion) return TypedefPartSize(link, writer);
+  const QualifiedName& name = link.GetVIName();
+  if (name.NumElts() == 0) return 10;
+  const int32_t n = static_cast<int32_t>(name.GetFileName().size());
+  return ((n + 2) | 1) + 7;
+}
+
+}  // namespace
+
+uint16_t TDImp::RecordCodeWord(uint32_t version) const {
+  uint16_t code = static_cast<uint8_t>(GetTypeCode());
+  const uint32_t flags = Flags();
+  if (name_ && name_->HasText()) code |= 0x4000;
+  if ((flags & kTDFlagNoSelect) != 0) code |= 0x8000;
+  if ((flags & kTDFlagEphemeral) != 0 && IsFunction() == 0) code |= 0x0200;
+  if ((flags & kTDFlagEventDiscard) != 0 && GetTypeCode() == static_cast<int16_t>(TypeCode::Boolean)) code |= 0x0100;
+  if ((flags & kTDFlagGeneric) != 0 && version >= kGenericFlagVersion) code |= 0x0400;
+  if ((flags & kTDFlagColumnVector) != 0) code |= 0x0800;
+  return code;
+}
+
+// Records are measured by writing the payload to a counting buffer: the size field then always
+// matches what is written, whatever the kind.
+int32_t TDImp::GetFlatSizeForSaving(int32_t* size, TDDataWriter* writer, int32_t* index) const {
+  if (size == nullptr || writer == nullptr) return kStatusNullHandle;
+  *size = 0;
+  if (const int32_t found = writer->GetSaveTableIndex(this); found >= 0) {
+    if (index != nullptr) *index = found;
+    return kStatusNoError;
+  }
+  PreflightOutputBuf counter;
+  OutputBuf* const previous = writer->SwapOutputBuf(&counter);
+  const int32_t status = FlattenTDPartsForSaving(writer);
+  writer->SwapOutputBuf(previous);
+  if (status != kStatusNoError) return status;
+  if (writer->GetError() != kStatusNoError) return writer->GetError();
+
+  int64_t total = 4 + static_cast<int64_t>(counter.GetBytesWritten());
+  if (name_ && name_->HasText()) {
+    int32_t nameSize = 0;
+    name_->AddFlatSize(&nameSize, writer);
+    total += nameSize;
+  }
+  int64_t deduction = 0;
+  if (typedef_) {
+    int32_t linkSize = 0;
+    typedef_->AddFlatSize(&linkSize, writer);
+    total += linkSize;
+    deduction = InnerSizeDeduction(*typedef_, *writer);
+  }
+  // Long fields take 2 more bytes each; growing one may push the other over, so settle both.
+  bool longSize = false;
+  bool longInner = false;
+  for (bool changed = true; changed;) {
+    changed = false;
+    if (!longSize && total > kLargestShortField) {
+      longSize = true;
+      total += 2;
+      changed = true;
+    }
+    if (typedef_ && !longInner && total - deduction > kLargestShortField) {
+      longInner = true;
+      total += 2;
+      changed = true;
+    }
+  }
+  if (total > INT32_MAX) return kStatusBadArgument;
+  *size = static_cast<int32_t>(total);
+  if (index != nullptr) *index = -1;
+  return kStatusNoError;
+}
+
+int32_t TDImp::FlattenTDForSaving(TDDataWriter* writer, int32_t* index) const {
+  if (writer == nullptr) return kStatusNullHandle;
+  if (const int32_t found = writer->GetSaveTableIndex(this); found >= 0) {
+    if (index != nullptr) *index = found;
+    return kStatusNoError;
+  }
+  const size_t start = writer->GetBytesWritten();
+  int32_t size = 0;
+  if (const int32_t status = GetFlatSizeForSaving(&size, writer, nullptr); status != kStatusNoError) {
+    writer->SetError(status);
+    return status;
+  }
+  writer->WriteVariableSizeField(size);
+  if (typedef_) {
+    writer->WriteU16(kTypedefMarker);
+    typedef_->Flatten(writer);
+    writer->WriteVariableSizeField(size - InnerSizeDeduction(*typedef_, *writer));
+  }
+  uint16_t codeWord = RecordCodeWord(writer->GetVersion());
+  if (GetTypeCode() == static_cast<int16_t>(TypeCode::FixedPoint) && writer->GetVersion() < kFixedPointVersion) {
+    codeWord = static_cast<uint16_t>((codeWord & 0xFF00) | static_cast<uint16_t>(TypeCode::Float64));
+    if (const PersistTDData* persist = writer->GetPersistTDData()) persist->LogSaveForPrevWarning(1);
+  }
+  writer->WriteU16(codeWord);
+  if (const int32_t status = FlattenTDPartsForSaving(writer); status != kStatusNoError) {
+    writer->SetError(status);
+    return status;
+  }
+  if (name_ && name_->HasText()) name_->Flatten(writer);
+  if (writer->GetError() != kStatusNoError) return writer->GetError();
+  if (writer->GetBytesWritten() - start != static_cast<size_t>(size) && IsFunction() == 0)
+    DebugReport(__FILE__, __LINE__, 3, "We calculated the wrong size.");
+  if (index != nullptr) *index = -1;
+  return kStatusNoError;
+}
+
+// Kinds without a payload read nothing.
+int32_t TDImp::ConstructTD(TDDataReader*) { return kStatusNoError; }
+
+// --- nesting -----------------------------------------------------------------------------------------
+
+void TDImp::ComputeNesting(uint32_t* depth, uint32_t* count) const {
+  *depth = 1;
+  *count = 1;
+}
+
+uint32_t TDImp::NestingDepth() const {
+  if (const uint32_t known = depth_.load(std::memory_order_acquire); known != 0) return known;
+  uint32_t depth = 0;
+  uint32_t count = 0;
+  ComputeNesting(&depth, &count);
+  if (IsReadOnlyTD() != 0) {
+    expanded_.store(count, std::memory_order_relaxed);
+    depth_.store(depth, std::memory_order_release);
+  }
+  return depth;
+}
+
+uint32_t TDImp::ExpandedCount() const {
+  if (depth_.load(std::memory_order_acquire) != 0) return expanded_.load(std::memory_order_relaxed);
+  uint32_t depth = 0;
+  uint32_t count = 0;
+  ComputeNesting(&depth, &count);
+  return count;
+}
 
 int32_t TDImp::GetAlignment(ITargetPlatformAlignment* platform) const { return DataSizeCore(platform); }
 
@@ -236,6 +392,7 @@ TDImpPtr TDImp::CheckIn() const {
   if (!copy) return TDImpPtr();
   // Members are interned outside the descriptor dictionary's lock, each under its own.
   if (MemberCheckIn(copy) != kStatusNoError) return TDImpPtr();
+  copy->NestingDepth();  // known before anyone else can see the object
   if (dictionary.Insert(copy) != kStatusNoError) return TDImpPtr();
   return copy;
 }

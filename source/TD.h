@@ -143,6 +143,10 @@ class TDImp : public TDRefCountedHashedObj {
   virtual void SetGenericness(int32_t generic);
   virtual bool HoldsContext() const { return false; }
 
+  // --- what the loaders and walks learn of a tree ----------------------------------------------
+  // Depth and expanded count from the elements' own (1 and 1 for a descriptor without any).
+  virtual void ComputeNesting(uint32_t* depth, uint32_t* count) const;
+
   // --- non-virtual members ---------------------------------------------------------------------
   // The interned equal object (made and inserted when absent); null when memory runs out.
   TDImpPtr CheckIn() const;
@@ -163,6 +167,17 @@ class TDImp : public TDRefCountedHashedObj {
 
   int32_t CmpTDCommon(const TDImp* other, int32_t flags) const;
 
+  // How many levels this descriptor's tree has (1 for one without elements) and how many
+  // descriptors the tree holds when each is counted every time it occurs (saturating). Kept by
+  // interned objects from their check-in, so constant time for them; the loaders' limits and
+  // every recursive walk rely on them.
+  uint32_t NestingDepth() const;
+  uint32_t ExpandedCount() const;
+
+  // The code word of this descriptor's record in a type string of `version`: the code with the
+  // flag bits of the record.
+  uint16_t RecordCodeWord(uint32_t version) const;
+
  protected:
   TDImp() noexcept = default;
   TDImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink) noexcept;
@@ -171,6 +186,9 @@ class TDImp : public TDRefCountedHashedObj {
   TDNameImpPtr name_;
   TDTypedefImpPtr typedef_;
   std::atomic<uint32_t> flags_{0};
+  // Cached nesting of an interned object; 0 until known.
+  mutable std::atomic<uint32_t> depth_{0};
+  mutable std::atomic<uint32_t> expanded_{0};
 };
 
 // What the descriptor dictionary calls to match interned descriptors.

@@ -6,6 +6,7 @@
 #include <string>
 
 #include "runtime/DebugStream.h"
+#include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
 
@@ -100,4 +101,13 @@ TDWCluster InheritTDWFromParentTDR(const TDRCluster& parent) {
   if (marker.SetAlignmentSource(source) != kStatusNoError) return TDWCluster(TDImpPtr(), 0);
   if (derived.AppendEltTD(marker) != kStatusNoError) return TDWCluster(TDImpPtr(), 0);
   return derived;
+}
+
+int32_t TDAlignmentMarkerImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  if (writer->GetVersion() < 0x08602000) {
+    DebugReport(__FILE__, __LINE__, 3, "Invalid type write");
+    writer->SetError(kStatusNullHandle);
+    return kStatusNullHandle;
+  }
+  return TDSingleContainerImp::FlattenTDPartsForSaving(writer);
 }

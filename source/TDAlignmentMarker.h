@@ -12,6 +12,8 @@ constexpr uint32_t kAlignmentSourcePlatformId = 0x34367877;
 
 class TDAlignmentMarkerImp final : public TDSingleContainerImp {
  public:
+  // Markers did not exist before 0x08602000: saving one for such a version is refused (42).
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
   TDAlignmentMarkerImp() noexcept = default;
   TDAlignmentMarkerImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink) noexcept
       : TDSingleContainerImp(name, typedefLink) {}

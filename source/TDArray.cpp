@@ -16,6 +16,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXStrings.h"
+#include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TDDataManager.h"
 #include "source/TDStringBase.h"
@@ -1749,4 +1750,34 @@ int32_t FixedArrayTDR(const TDRArrayBase& type, int32_t* err) {
     return 0;
   }
   return IsFixed(word) && word != kCountWordMalformed ? Length(word) : 0;
+}
+
+// --- type strings ----------------------------------------------------------------------------------
+
+int32_t TDArrayBaseImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  if (!hasDims_ || dims_.size() > UINT16_MAX) {
+    writer->SetError(kStatusNullHandle);
+    return kStatusNullHandle;
+  }
+  writer->WriteU16(static_cast<uint16_t>(dims_.size()));
+  for (const int32_t word : dims_) writer->WriteI32(word);
+  return TDSingleContainerImp::FlattenTDPartsForSaving(writer);
+}
+
+int32_t TDArrayBaseImp::ConstructTD(TDDataReader* reader) {
+  uint16_t count = 0;
+  if (const int32_t status = reader->ReadU16(&count); status != kStatusNoError) return status;
+  // Each word takes four bytes: a count the input cannot hold is damage, found before allocating.
+  if (static_cast<size_t>(count) * 4 > reader->BytesLeft()) {
+    reader->SetError(kStatusCorruptData);
+    return kStatusCorruptData;
+  }
+  if (const int32_t status = InitDims(count); status != kStatusNoError) return status;
+  for (int32_t i = 0; i < count; ++i) {
+    int32_t word = 0;
+    if (const int32_t status = reader->ReadI32(&word); status != kStatusNoError) return status;
+    dims_[static_cast<size_t>(i)] = word;
+  }
+  ClearHashValid();
+  return TDSingleContainerImp::ConstructTD(reader);
 }

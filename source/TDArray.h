@@ -48,6 +48,10 @@ class TDArrayBaseImp : public TDSingleContainerImp {
   // at least as large) and whose element converts without loss.
   bool ConversionIsLossless(const TDImp* dst) const override;
   int32_t IsArrayBase() const override { return 1; }
+  // The dimension count, each dimension word, then the element's index. 42 without a
+  // dimension list.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  int32_t ConstructTD(TDDataReader* reader) override;
   int32_t IsSemiGeneric() const override;
   // An array of Float64 waveforms.
   int32_t IsArrayFloat64Wfms() const override;

@@ -108,7 +108,8 @@ int32_t TDNameImp::Flatten(TDDataWriter* writer) const {
 
 int32_t TDNameImp::UnFlatten(TDDataReader* reader) {
   uint8_t text[256] = {};
-  const int32_t status = reader->ReadPStr(text);
+  int32_t status = reader->ReadPStr(text);
+  if (status == kStatusNoError && (text[0] + 1) % 2 != 0) status = reader->Skip(1);  // the pad byte
   if (status != kStatusNoError) return status;
   return SetNamePStr(text);
 }
@@ -185,6 +186,7 @@ int32_t TDTypedefImp::UnFlatten(TDDataReader* reader) {
   if (reader->GetVersion() < kTypedefOneNameVersion) {
     uint8_t text[256] = {};
     status = reader->ReadPStr(text);
+    if (status == kStatusNoError && (text[0] + 1) % 2 != 0) status = reader->Skip(1);  // the pad byte
     if (status == kStatusNoError) status = viName.Insert(text, 0);
   } else {
     status = viName.UnFlatten(reader);

@@ -10,6 +10,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXStrings.h"
+#include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TDDataManager.h"
 #include "source/TypeManager.h"
@@ -668,4 +669,40 @@ const TDR& GetSubArrayTD() {
     record << TDWPtr(U("dataPtr")) << dimensions;
     return record.GetNumElts() == 2 ? record.GetImpPtr() : TDImpPtr();
   });
+}
+
+// --- type strings ----------------------------------------------------------------------------------
+
+int32_t TDSizedBlockImp::FlattenTDPartsForSaving(TDDataWriter* writer) const { return writer->WriteI32(blockSize_); }
+
+int32_t TDSizedBlockImp::ConstructTD(TDDataReader* reader) {
+  int32_t size = 0;
+  if (const int32_t status = reader->ReadI32(&size); status != kStatusNoError) return status;
+  SetBlockSize(size);
+  return kStatusNoError;
+}
+
+int32_t TDAlignedBlockImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  TDSizedBlockImp::FlattenTDPartsForSaving(writer);
+  return writer->WriteU16(alignment_);
+}
+
+int32_t TDAlignedBlockImp::ConstructTD(TDDataReader* reader) {
+  if (const int32_t status = TDSizedBlockImp::ConstructTD(reader); status != kStatusNoError) return status;
+  uint16_t alignment = 0;
+  if (const int32_t status = reader->ReadU16(&alignment); status != kStatusNoError) return status;
+  SetStoredAlignment(alignment);
+  return kStatusNoError;
+}
+
+int32_t TDRepeatedBlockImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  writer->WriteU32(numBlocks_);
+  return TDBlockContainerImp::FlattenTDPartsForSaving(writer);
+}
+
+int32_t TDRepeatedBlockImp::ConstructTD(TDDataReader* reader) {
+  uint32_t count = 0;
+  if (const int32_t status = reader->ReadU32(&count); status != kStatusNoError) return status;
+  SetNumBlocks(count);
+  return TDBlockContainerImp::ConstructTD(reader);
 }

@@ -25,6 +25,9 @@ class TDSizedBlockImp : public TDImp {
   int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const override;
   int32_t CompareForSorting(const TDImp* other) const override;
   int32_t IsSizedBlock() const override { return 1; }
+  // The block size.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  int32_t ConstructTD(TDDataReader* reader) override;
 
   int32_t GetBlockSize() const noexcept { return blockSize_; }
   void SetBlockSize(int32_t size);
@@ -67,6 +70,9 @@ class TDAlignedBlockImp final : public TDSizedBlockImp {
   int32_t CompareForSorting(const TDImp* other) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t IsAlignedBlock() const override { return 1; }
+  // The block size, then the alignment.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  int32_t ConstructTD(TDDataReader* reader) override;
 
   uint16_t GetStoredAlignment() const noexcept { return alignment_; }
   void SetStoredAlignment(uint16_t alignment);
@@ -172,6 +178,10 @@ class TDRepeatedBlockImp final : public TDBlockContainerImp {
   int32_t CompareForSorting(const TDImp* other) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t IsRepeatedBlock() const override { return 1; }
+
+  // The number of blocks, then the element's index.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  int32_t ConstructTD(TDDataReader* reader) override;
 
   uint32_t GetNumBlocks() const noexcept { return numBlocks_; }
   void SetNumBlocks(uint32_t count);

@@ -2,12 +2,14 @@
 // traversal, ephemeral marking, the Boolean mutation) and the editing of their elements.
 #include "source/TDContainer.h"
 
+#include <algorithm>
 #include <bit>
 #include <new>
 #include <string>
 
 #include "runtime/DebugStream.h"
 #include "runtime/PXStrings.h"
+#include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 
 namespace {
@@ -528,4 +530,90 @@ TDWMultiContainer& TDWMultiContainer::operator<<(const TD& element) {
   if (vellum::detail::AppendInChain(*this, element)) return *this;
   static TDWMultiContainer broken(TDImpPtr(), 0);
   return broken;
+}
+
+// --- type strings ----------------------------------------------------------------------------------
+
+namespace {
+
+// Clusters count their elements in a 16-bit word wherever they are walked.
+constexpr int32_t kMaxClusterElements = 0xFFFF;
+
+}  // namespace
+
+int32_t WriteEltIndex(TDDataWriter* writer, const TDImpPtr& element) {
+  const int32_t index = element ? writer->GetSaveTableIndex(element.get()) : -1;
+  if (index < 0) {
+    writer->SetError(kStatusNullHandle);
+    return kStatusNullHandle;
+  }
+  return writer->WriteVariableSizeField(index);
+}
+
+int32_t TDContainerImp::FlattenTDForSaving(TDDataWriter* writer, int32_t* index) const {
+  if (writer == nullptr) return kStatusNullHandle;
+  if (const int32_t found = writer->GetSaveTableIndex(this); found >= 0) {
+    if (index != nullptr) *index = found;
+    return kStatusNoError;
+  }
+  const int32_t count = GetNumElts();
+  for (int32_t i = 0; i < count; ++i) {
+    const TDImpPtr& element = GetEltImpPtr(i);
+    if (!element) continue;
+    uint32_t elementIndex = 0;
+    if (const int32_t status = SaveTDRecord(element.get(), writer, &elementIndex); status != kStatusNoError)
+      return status;
+  }
+  return TDImp::FlattenTDForSaving(writer, index);
+}
+
+void TDContainerImp::ComputeNesting(uint32_t* depth, uint32_t* count) const {
+  uint32_t deepest = 0;
+  uint64_t total = 1;
+  const int32_t elements = GetNumElts();
+  for (int32_t i = 0; i < elements; ++i) {
+    const TDImpPtr& element = GetEltImpPtr(i);
+    if (!element) continue;
+    deepest = std::max(deepest, element->NestingDepth());
+    total += element->ExpandedCount();
+  }
+  *depth = deepest + 1;
+  *count = static_cast<uint32_t>(std::min<uint64_t>(total, UINT32_MAX));
+}
+
+int32_t TDSingleContainerImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  return WriteEltIndex(writer, element_);
+}
+
+int32_t TDSingleContainerImp::ConstructTD(TDDataReader* reader) {
+  TDImpPtr element = reader->RetrieveTDFromLoadTable();
+  if (!element) return reader->GetError() != kStatusNoError ? reader->GetError() : kStatusNullHandle;
+  SetElt(element);
+  return kStatusNoError;
+}
+
+int32_t TDMultiContainerImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  writer->WriteVariableSizeField(GetNumElts());
+  for (const TDImpPtr& element : elements_)
+    if (const int32_t status = WriteEltIndex(writer, element); status != kStatusNoError) return status;
+  return writer->GetError();
+}
+
+int32_t TDMultiContainerImp::ConstructTD(TDDataReader* reader) {
+  int32_t count = 0;
+  if (const int32_t status = reader->ReadVariableSizeField(&count); status != kStatusNoError) return status;
+  if (count < 0 || count > kMaxClusterElements) {
+    (VELLUM_DEBUG(2) << "Too many elements in a container: " << count).Process();
+    reader->SetError(kStatusCorruptData);
+    return kStatusCorruptData;
+  }
+  // Each index takes at least two bytes: a count the input cannot hold reserves no more.
+  const auto room = static_cast<int32_t>(std::min<size_t>(static_cast<size_t>(count), reader->BytesLeft() / 2));
+  if (const int32_t status = ReserveElts(room); status != kStatusNoError) return status;
+  for (int32_t i = 0; i < count; ++i) {
+    TDImpPtr element = reader->RetrieveTDFromLoadTable();
+    if (!element) return reader->GetError() != kStatusNoError ? reader->GetError() : kStatusNullHandle;
+    if (const int32_t status = AppendElt(element); status != kStatusNoError) return status;
+  }
+  return kStatusNoError;
 }

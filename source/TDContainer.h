@@ -35,6 +35,9 @@ class TDContainerImp : public TDImp {
   // interned container it goes into a writable copy that is handed up as this one's replacement.
   TDTraverseValue TraverseTD(TDVisitFn visit, void* context, TDShouldRecurseFn shouldRecurse,
                              TDImpPtr* replacement) override;
+  // The present elements' records first (each once), then this one's.
+  int32_t FlattenTDForSaving(TDDataWriter* writer, int32_t* index) const override;
+  void ComputeNesting(uint32_t* depth, uint32_t* count) const override;
 
   // --- container slots -------------------------------------------------------------------------
   // A one-element container always counts one element, present or not.
@@ -67,6 +70,11 @@ class TDSingleContainerImp : public TDContainerImp {
   const TDImpPtr& GetElt() const noexcept { return element_; }
   void SetElt(const TDImpPtr& element);
 
+  // The element's save-table index.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  // The element from its load-table index; 42 when there is none.
+  int32_t ConstructTD(TDDataReader* reader) override;
+
   // Converting a cluster into a one-dimensional variable array of this container's kind: resizes
   // the datum at `data` to `count` elements, writes its dimension word and stores where its
   // first element lies. 0; 2 when memory runs out; 1, with nothing changed, when this kind is not
@@ -92,6 +100,11 @@ class TDMultiContainerImp : public TDContainerImp {
   int32_t MemberCheckIn(TDImpPtr& target) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t IsMultiContainer() const override { return 1; }
+  // The element count, then each element's save-table index.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  // A count of more than 65535 elements is outside the format and refused (74); a missing
+  // element is 42.
+  int32_t ConstructTD(TDDataReader* reader) override;
 
   int32_t GetNumElts() const override { return static_cast<int32_t>(elements_.size()); }
   const TDImpPtr& GetEltImpPtr(int32_t index) const override;
@@ -129,3 +142,7 @@ bool AppendInChain(TDWMultiContainer& container, const TD& element);
 // The order of two element descriptors: an absent one first, then by type code, then by the
 // kind's own order.
 int32_t CompareEltsForSorting(const TDImp* a, const TDImp* b);
+
+// The save-table index of an element whose record is already written, as a VSF; 42 when it
+// is missing from the table.
+int32_t WriteEltIndex(TDDataWriter* writer, const TDImpPtr& element);

@@ -223,7 +223,7 @@ class BasicNumericFactory final : public TDTypeFactory {
         type->SetUnits(units);
       }
     }
-    if (reader->GetVersion() >= kNumFlagsVersion) {
+    if (!VersionShouldMutate(reader->GetVersion(), kNumFlagsVersion)) {
       uint8_t numFlags = 0;
       *status = reader->ReadU8(&numFlags);
       if (*status != kStatusNoError) return TDImpPtr();
@@ -1083,4 +1083,15 @@ int32_t TDWBasicNumeric::RemoveEnum() {
   if (basic == nullptr) return kStatusNullHandle;
   basic->SetEnumImpPtr(TDEnumImpPtr());
   return kStatusNoError;
+}
+
+int32_t TDBasicNumericImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  if (enum_) {
+    if (const int32_t status = enum_->Flatten(writer); status != kStatusNoError) return status;
+  }
+  if (units_) {
+    if (const int32_t status = units_->Flatten(writer); status != kStatusNoError) return status;
+  }
+  if (!VersionShouldMutate(writer->GetVersion(), kNumFlagsVersion)) writer->WriteU8(numFlags_);
+  return writer->GetError();
 }

@@ -70,6 +70,9 @@ class TDBasicNumericImp : public TDNumericImp {
   int32_t MemberCheckIn(TDImpPtr& target) const override;
   int32_t HasEnum() const override { return enum_ ? 1 : 0; }
   int32_t HasUnits() const override { return units_ ? 1 : 0; }
+  // The enumeration, the units, then the flag byte for versions that have it. The factory
+  // reads them back.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
   int32_t DataSizeCore(ITargetPlatformAlignment* platform) const override;
   int32_t GetAlignment(ITargetPlatformAlignment* platform) const override;
   int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;

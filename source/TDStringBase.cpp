@@ -16,6 +16,7 @@
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXStrings.h"
 #include "source/MoveBytes.h"
+#include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TDDataManager.h"
 #include "source/TypeManager.h"
@@ -741,4 +742,15 @@ int32_t TDRSubString::GetStringPtrOffset(ITargetPlatformAlignment* platform) con
 int32_t TDRSubString::GetLengthOffset(ITargetPlatformAlignment* platform) const {
   if (platform == nullptr) return static_cast<int32_t>(offsetof(SubStringRec, length));
   return TDRCluster(GetSubStringRecTD().GetImpPtr(), 1).GetEltOffset(kRecordLength, platform);
+}
+
+// --- type strings ----------------------------------------------------------------------------------
+
+int32_t TDStringBaseImp::FlattenTDPartsForSaving(TDDataWriter* writer) const { return writer->WriteI32(bound_); }
+
+int32_t TDStringBaseImp::ConstructTD(TDDataReader* reader) {
+  int32_t bound = 0;
+  if (const int32_t status = reader->ReadI32(&bound); status != kStatusNoError) return status;
+  SetBound(bound);
+  return kStatusNoError;
 }

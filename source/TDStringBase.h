@@ -38,6 +38,9 @@ class TDStringBaseImp : public TDImp {
   // With flag 0, a variable string's handle larger than 4 bytes is given back whole (the value
   // is meant to be dead): the result is its size.
   int32_t ShrinkData(void* data, void* end, int32_t flag, const HandleAllocationInterface& allocator) const override;
+  // The bound word.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  int32_t ConstructTD(TDDataReader* reader) override;
   int32_t IsFlatDataFixedSize() const override { return vellum::bound::IsFixed(bound_) ? 1 : 0; }
   int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;
   // Into the same code, or between String and Tag, following the destination's bound word.

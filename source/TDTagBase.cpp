@@ -8,6 +8,7 @@
 
 #include "runtime/DebugStream.h"
 #include "runtime/PXStrings.h"
+#include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
 
@@ -44,7 +45,40 @@ int32_t CompareClasses(const uint8_t* a, const uint8_t* b) {
 }
 
 
-EmptyTypeFactory<TDTagImp> gTagFactory;
+// Reads the bound word and the kind, which decide the class, and leaves the rest of the record
+// to the tag's ConstructTD.
+class TagFactory final : public TDTypeFactory {
+ public:
+  TDImpPtr CreateTD(TDDataReader* reader, uint16_t, int32_t* status) const override {
+    int32_t bound = vellum::bound::kVariable;
+    uint16_t kind = static_cast<uint16_t>(kTagTypeDefault);
+    if (reader != nullptr) {
+      reader->ReadI32(&bound);
+      reader->ReadU16(&kind);
+      if (reader->GetError() != kStatusNoError) {
+        *status = reader->GetError();
+        return TDImpPtr();
+      }
+    }
+    TDImpPtr type;
+    if (kind == kTagTypeUserDefined) {
+      type = MakeCounted<TDUserDefinedTagImp>();
+    } else {
+      auto tag = MakeCounted<TDTagImp>();
+      if (tag) tag->SetTagType(static_cast<TagType>(kind));
+      type = tag;
+    }
+    if (!type) {
+      *status = kStatusOutOfMemory;
+      return type;
+    }
+    static_cast<TDStringBaseImp&>(*type).SetBound(bound);
+    *status = kStatusNoError;
+    return type;
+  }
+};
+
+TagFactory gTagFactory;
 
 // Announced as the library loads; the service registers it in its place at start.
 const bool gAnnounced = [] {
@@ -340,4 +374,83 @@ int32_t TDWUserDefinedTag::SetTagClassCStr(const uint8_t* tagClassCStr) {
   if (tag == nullptr) return kStatusNullHandle;
   const size_t length = tagClassCStr != nullptr ? std::strlen(reinterpret_cast<const char*>(tagClassCStr)) : 0;
   return tag->SetTagClass(tagClassCStr, length);
+}
+
+// --- type strings ----------------------------------------------------------------------------------
+
+namespace {
+
+// Versions whose tag records carry the tag's user data.
+bool CarriesUserData(uint32_t version) {
+  return (version >= 0x08208003 && version < 0x08212000) || version >= 0x08502031;
+}
+// The user-defined tag's class entered the record in this version.
+constexpr uint32_t kTagClassVersion = 0x08102000;
+
+// How deep tag user data reads are nested on this thread: each holds a type string of its own.
+thread_local uint32_t gUserDataDepth = 0;
+
+// The empty variant: version word, the void type, no data, no attributes.
+int32_t WriteEmptyUserData(TDDataWriter* writer) {
+  writer->WriteU32(writer->GetVersion());
+  writer->WriteTD(MakeDefaultTDRForTypeCode(static_cast<int32_t>(TypeCode::Void)));
+  writer->WriteI32(0);
+  return writer->GetError();
+}
+
+int32_t ReadEmptyUserData(TDDataReader* reader) {
+  if (gUserDataDepth >= kMaxTypeNestingDepth) {
+    DebugReport(__FILE__, __LINE__, 2, "Type string refused: nesting deeper than 256 levels");
+    reader->SetError(kStatusCorruptData);
+    return kStatusCorruptData;
+  }
+  ++gUserDataDepth;
+  uint32_t header = 0;
+  reader->ReadU32(&header);
+  const TDR type = reader->ReadTD();
+  int32_t attributes = 0;
+  reader->ReadI32(&attributes);
+  --gUserDataDepth;
+  if (reader->GetError() != kStatusNoError) return reader->GetError();
+  if ((type && type.GetTypeCode() != static_cast<int16_t>(TypeCode::Void)) || attributes != 0) {
+    DebugReport(__FILE__, __LINE__, 2, "Tag user data other than the empty variant cannot be read yet");
+    reader->SetError(kStatusCorruptData);
+    return kStatusCorruptData;
+  }
+  return kStatusNoError;
+}
+
+}  // namespace
+
+int32_t TDTagBaseImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  writer->WriteI32(GetBound());
+  writer->WriteU16(static_cast<uint16_t>(tagType_));
+  if (CarriesUserData(writer->GetVersion())) return WriteEmptyUserData(writer);
+  return writer->GetError();
+}
+
+int32_t TDTagBaseImp::ConstructTD(TDDataReader* reader) {
+  if (CarriesUserData(reader->GetVersion()))
+    if (const int32_t status = ReadEmptyUserData(reader); status != kStatusNoError) return status;
+  SetContext(reader->GetContext());
+  return reader->GetError();
+}
+
+int32_t TDUserDefinedTagImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  if (const int32_t status = TDTagBaseImp::FlattenTDPartsForSaving(writer); status != kStatusNoError) return status;
+  if (writer->GetVersion() < kTagClassVersion) return writer->GetError();
+  const uint8_t* tagClass = GetTagClass();
+  writer->WritePStr(tagClass);
+  if (((tagClass != nullptr ? tagClass[0] : 0) + 1) % 2 != 0) writer->WriteU8(0);
+  return writer->GetError();
+}
+
+int32_t TDUserDefinedTagImp::ConstructTD(TDDataReader* reader) {
+  if (const int32_t status = TDTagBaseImp::ConstructTD(reader); status != kStatusNoError) return status;
+  if (reader->GetVersion() < kTagClassVersion) return kStatusNoError;
+  uint8_t tagClass[256] = {};
+  if (const int32_t status = reader->ReadPStr(tagClass); status != kStatusNoError) return status;
+  if ((tagClass[0] + 1) % 2 != 0) reader->Skip(1);
+  if (reader->GetError() != kStatusNoError) return reader->GetError();
+  return SetTagClass(tagClass + 1, tagClass[0]);
 }

@@ -29,6 +29,11 @@ class TDTagBaseImp : public TDStringBaseImp {
   // Clears hash-valid.
   void SetContext(const KoContext* context) override;
   bool HoldsContext() const override { return true; }
+  // The bound word, the kind, then for the versions that carry one the user data (a variant;
+  // tags carry none yet, so an empty one is written and only an empty one is read). The factory
+  // reads the bound word and the kind, which decide the class.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  int32_t ConstructTD(TDDataReader* reader) override;
 
   // --- members ---------------------------------------------------------------------------------
   TagType GetTagType() const noexcept { return tagType_; }
@@ -75,6 +80,9 @@ class TDUserDefinedTagImp final : public TDTagBaseImp {
   // After the tag's own order: no class first, then the classes in PStr order.
   int32_t CompareForSorting(const TDImp* other) const override;
   int32_t IsUserDefinedTag() const override { return 1; }
+  // The tag's part, then for versions that have it the class, padded to even length.
+  int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  int32_t ConstructTD(TDDataReader* reader) override;
 
   // The class as a PStr, or null when there is none.
   const uint8_t* GetTagClass() const noexcept { return tagClass_.get(); }

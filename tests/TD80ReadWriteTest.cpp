@@ -1,0 +1,314 @@
+// Type strings: the stored bytes of descriptor records and lists, loading them back, the
+// version rules, and the refusals that keep damaged or hostile strings from harming the host.
+#include <gtest/gtest.h>
+
+#include <cstdio>
+#include <cstring>
+#include <string>
+#include <vector>
+
+#include "TestSupport.h"
+#include "TypeSystemFixture.h"
+#include "runtime/PXApp.h"
+#include "runtime/PXResources.h"
+#include "vellum.h"
+#include "vellum/TypeStrings.h"
+
+namespace {
+
+class TD80ReadWriteTest : public TypeSystemTest {};
+
+// "00 05 ..." for bytes.
+std::string Hex(const uint8_t* data, size_t size) {
+  std::string text;
+  for (size_t i = 0; i < size; ++i) {
+    char pair[4];
+    std::snprintf(pair, sizeof pair, i == 0 ? "%02X" : " %02X", data[i]);
+    text += pair;
+  }
+  return text;
+}
+
+std::vector<uint8_t> FromHex(const std::string& text) {
+  std::vector<uint8_t> bytes;
+  for (size_t i = 0; i + 1 < text.size() + 1;) {
+    while (i < text.size() && text[i] == ' ') ++i;
+    if (i + 1 >= text.size() + 0 && i >= text.size()) break;
+    bytes.push_back(static_cast<uint8_t>(std::stoul(text.substr(i, 2), nullptr, 16)));
+    i += 2;
+  }
+  return bytes;
+}
+
+std::string Flat(const TDR& type, uint32_t version = PXApp::Instance().GetVersion()) {
+  const PersistTDData persist(version);
+  UHandle h = nullptr;
+  const int32_t status = FlattenOneType(&persist, type, &h, nullptr);
+  if (status != kStatusNoError) return "status " + std::to_string(status);
+  std::string text = Hex(*h, DSGetHandleSize(h));
+  DSDisposeHandle(h);
+  return text;
+}
+
+std::string FlatList(const std::vector<TDR>& types) {
+  TMTypeList list;
+  for (const TDR& type : types) EXPECT_EQ(list.AppendType(type, nullptr), kStatusNoError);
+  UHandle h = nullptr;
+  const int32_t status = FlattenListOfTypes(nullptr, &list, nullptr, &h, 0, nullptr, 0);
+  if (status != kStatusNoError) return "status " + std::to_string(status);
+  std::string text = Hex(*h, DSGetHandleSize(h));
+  DSDisposeHandle(h);
+  return text;
+}
+
+int32_t Load(const std::vector<uint8_t>& bytes, TDR* out, uint32_t version = PXApp::Instance().GetVersion()) {
+  const PersistTDData persist(version);
+  return UnFlattenOneType(&persist, bytes.data(), static_cast<uint32_t>(bytes.size()), out, nullptr);
+}
+
+TDR RoundTrip(const TDR& type) {
+  UHandle h = nullptr;
+  EXPECT_EQ(FlattenOneType(nullptr, type, &h, nullptr), kStatusNoError);
+  TDR back;
+  EXPECT_EQ(UnFlattenOneType(nullptr, h, &back, nullptr), kStatusNoError);
+  DSDisposeHandle(h);
+  return back;
+}
+
+// --- the stored bytes --------------------------------------------------------------------------------
+
+TEST_F(TD80ReadWriteTest, GoldenRecordsOfTheCommonShapes) {
+  EXPECT_EQ(Flat(GetiL()), "00 00 00 01 00 05 00 03 00 00 01 00 00");
+  EXPECT_EQ(Flat(GetStringTD()), "00 00 00 01 00 08 00 30 FF FF FF FF 00 01 00 00");
+  EXPECT_EQ(Flat(TDRArray(1, GetfD())),
+            "00 00 00 02 00 05 00 0A 00 00 0C 00 40 00 01 FF FF FF FF 00 00 00 01 00 01");
+  TDWCluster mixed;
+  mixed << GetiL() << GetStringTD();
+  EXPECT_EQ(Flat(mixed.CheckIn()),
+            "00 00 00 03 00 05 00 03 00 00 08 00 30 FF FF FF FF 00 0A 00 50 00 02 00 00 00 01 00 01 00 02");
+  TDWCluster twins;
+  twins << GetiL() << GetiL();
+  EXPECT_EQ(Flat(twins.CheckIn()), "00 00 00 02 00 05 00 03 00 00 0A 00 50 00 02 00 00 00 00 00 01 00 01");
+  EXPECT_EQ(Flat(TDR()), "00 00 00 00 00 00");
+  EXPECT_EQ(FlatList({}), "00 00 00 00 00 00");
+  // Equal descriptors share one record; the list refers to it twice.
+  EXPECT_EQ(FlatList({GetiL(), GetStringTD(), GetiL()}),
+            "00 00 00 02 00 05 00 03 00 00 08 00 30 FF FF FF FF 00 03 00 00 00 01 00 00");
+}
+
+TEST_F(TD80ReadWriteTest, NamesArePaddedToEvenLength) {
+  TDWInt32 three;
+  three.SetName("abc");
+  EXPECT_EQ(Flat(three.CheckIn()), "00 00 00 01 00 09 40 03 00 03 61 62 63 00 01 00 00");
+  TDWInt32 four;
+  four.SetName("abcd");
+  EXPECT_EQ(Flat(four.CheckIn()), "00 00 00 01 00 0B 40 03 00 04 61 62 63 64 00 00 01 00 00");
+  EXPECT_EQ(RoundTrip(three.CheckIn()), three.CheckIn());
+  EXPECT_EQ(RoundTrip(four.CheckIn()), four.CheckIn());
+}
+
+TEST_F(TD80ReadWriteTest, TypedefLinkPrecedesTheCodeWord) {
+  TDWInt32 linked;
+  ASSERT_EQ(linked.SetTypedef(Link("abcde", 0x01020304)), kStatusNoError);
+  const TDR type = linked.CheckIn();
+  EXPECT_EQ(Flat(type), "00 00 00 01 00 17 00 F1 01 02 03 04 00 00 00 01 05 61 62 63 64 65 00 09 00 03 00 00 01 00 00");
+  EXPECT_EQ(RoundTrip(type), type);
+  // Before 0x08608002 the inner size left out what the one-name layout took, ((n + 2) | 1) + 7:
+  // the same as now for five letters, one more for six.
+  TDWInt32 six;
+  ASSERT_EQ(six.SetTypedef(Link("abcdef", 0x01020304)), kStatusNoError);
+  EXPECT_EQ(Flat(six.CheckIn()), "00 00 00 01 00 18 00 F1 01 02 03 04 00 00 00 01 06 61 62 63 64 65 66 00 09 00 03 00 00 01 00 00");
+  EXPECT_EQ(Flat(six.CheckIn(), 0x08608001),
+            "00 00 00 01 00 18 00 F1 01 02 03 04 00 00 00 01 06 61 62 63 64 65 66 00 08 00 03 00 00 01 00 00");
+}
+
+TEST_F(TD80ReadWriteTest, CodeWordFlags) {
+  TDWInt32 flagged;
+  flagged.SetNoSelectMask(1);
+  flagged.SetGenericness(1);
+  flagged.EphemeralizeTD();
+  const TDR type = flagged.CheckIn();
+  EXPECT_EQ(Flat(type), "00 00 00 01 00 05 86 03 00 00 01 00 00");
+  EXPECT_EQ(RoundTrip(type), type);
+  // The generic bit is left out before 0x09002000, and so is the flag byte before 0x08604012.
+  EXPECT_EQ(Flat(type, 0x08604011), "00 00 00 01 00 04 82 03 00 01 00 00");
+
+  TDWBoolean discard;
+  discard.SetEventDiscardMask(1);
+  EXPECT_EQ(Flat(discard.CheckIn()), "00 00 00 01 00 04 01 21 00 01 00 00");
+  EXPECT_EQ(RoundTrip(discard.CheckIn()), discard.CheckIn());
+  // The event-discard bit means nothing on another code.
+  TDR loaded;
+  ASSERT_EQ(Load(FromHex("00 00 00 01 00 05 01 03 00 00 01 00 00"), &loaded), kStatusNoError);
+  EXPECT_EQ(loaded, GetiL());
+}
+
+TEST_F(TD80ReadWriteTest, LongRecordsAndIndicesTakeFourBytes) {
+  // An enumeration of 200 names of 200 letters makes a record above 32767 bytes.
+  TDWEnum items;
+  const std::string item(200, 'q');
+  for (int i = 0; i < 200; ++i) items << (item + std::to_string(i)).c_str();
+  const TDR big = TDWUInt16(items, nullptr).CheckIn();
+  const std::string flat = Flat(big);
+  const std::vector<uint8_t> bytes = FromHex(flat);
+  ASSERT_GT(bytes.size(), 32768u);
+  EXPECT_EQ(bytes[4] & 0x80, 0x80) << "the size field has bit 31 set";
+  const uint32_t size = ((bytes[4] & 0x7Fu) << 24) | (bytes[5] << 16) | (bytes[6] << 8) | bytes[7];
+  EXPECT_EQ(size, bytes.size() - 4 - 4);
+  TDR back;
+  ASSERT_EQ(Load(bytes, &back), kStatusNoError);
+  EXPECT_EQ(back, big);
+
+  // A cluster of 32770 distinct elements refers to its last ones with 4-byte indices.
+  TDWCluster wide;
+  for (int i = 0; i < 32770; ++i) {
+    TDWInt8 element;
+    element.SetName(std::to_string(i));
+    wide << element;
+  }
+  const TDR cluster = wide.CheckIn();
+  UHandle h = nullptr;
+  ASSERT_EQ(FlattenOneType(nullptr, cluster, &h, nullptr), kStatusNoError);
+  const size_t total = DSGetHandleSize(h);
+  // The tail: the cluster's last indices 0x80008000, 0x80008001, then one entry, index 32770.
+  EXPECT_EQ(Hex(*h + total - 14, 14), "80 00 80 00 80 00 80 01 00 01 80 00 80 02");
+  TDR wideBack;
+  ASSERT_EQ(UnFlattenOneType(nullptr, h, &wideBack, nullptr), kStatusNoError);
+  EXPECT_EQ(wideBack, cluster);
+  DSDisposeHandle(h);
+}
+
+TEST_F(TD80ReadWriteTest, OneTypeLoadsAsTheSharedDescriptor) {
+  TDR loaded;
+  ASSERT_EQ(Load(FromHex("00 00 00 01 00 05 00 03 00 00 01 00 00"), &loaded), kStatusNoError);
+  EXPECT_EQ(loaded.GetImpPtr(), GetiL().GetImpPtr());
+  ASSERT_EQ(Load(FromHex("00 00 00 00 00 00"), &loaded), kStatusNoError);
+  EXPECT_FALSE(loaded);
+  TMTypeList list;
+  ASSERT_EQ(UnFlattenListOfTypes(nullptr, FromHex("00 00 00 00 00 00").data(), 6, &list, nullptr, 0, nullptr),
+            kStatusNoError);
+  EXPECT_EQ(list.GetNumTypes(), 0);
+}
+
+TEST_F(TD80ReadWriteTest, ExtraValuesFollowTheirIndices) {
+  TMTypeList list;
+  list.AppendType(GetiL(), nullptr);
+  list.AppendType(GetfD(), nullptr);
+  const uint32_t extra[] = {7, 40000};
+  UHandle h = nullptr;
+  ASSERT_EQ(FlattenListOfTypes(nullptr, &list, extra, &h, 0, nullptr, 0), kStatusNoError);
+  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)),
+            "00 00 00 02 00 05 00 03 00 00 05 00 0A 00 00 02 00 00 00 07 00 01 80 00 9C 40");
+  TMTypeList back;
+  uint32_t* values = nullptr;
+  ASSERT_EQ(UnFlattenListOfTypes(nullptr, h, &back, &values, 0, nullptr), kStatusNoError);
+  ASSERT_EQ(back.GetNumTypes(), 2);
+  EXPECT_EQ(back.GetType(1), GetfD());
+  ASSERT_NE(values, nullptr);
+  EXPECT_EQ(values[0], 7u);
+  EXPECT_EQ(values[1], 40000u);
+  DSDisposePtr(reinterpret_cast<UPtr>(values));
+  DSDisposeHandle(h);
+}
+
+TEST_F(TD80ReadWriteTest, SkippedEmptyEntriesReuseThePreviousIndex) {
+  TMTypeList list;
+  list.AppendType(TDR(), nullptr);
+  list.AppendType(GetfD(), nullptr);
+  list.AppendType(TDR(), nullptr);
+  UHandle h = nullptr;
+  ASSERT_EQ(FlattenListOfTypes(nullptr, &list, nullptr, &h, 0, nullptr, 1), kStatusNoError);
+  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)), "00 00 00 01 00 05 00 0A 00 00 03 00 00 00 00 00 00");
+  DSDisposeHandle(h);
+}
+
+TEST_F(TD80ReadWriteTest, SavedResourcesLoadBack) {
+  TDWCluster cluster;
+  cluster << GetiL() << GetPathTD();
+  const TDR type = cluster.CheckIn();
+  ASSERT_EQ(SaveListOfOneType(nullptr, 9, 128, 0x54595045, type), kStatusNoError);
+  TDR back;
+  ASSERT_EQ(LoadListOfOneType(nullptr, 9, 128, 0x54595045, &back), kStatusNoError);
+  EXPECT_EQ(back, type);
+  EXPECT_EQ(LoadListOfOneType(nullptr, 9, 129, 0x54595045, &back), kStatusNullHandle);
+  RCloseFile(9);
+}
+
+// --- refusals ----------------------------------------------------------------------------------------
+
+TEST_F(TD80ReadWriteTest, DamagedStringsFailWithAMessage) {
+  DebugCapture capture;
+  TDR out;
+  // A record size below 4.
+  EXPECT_EQ(Load(FromHex("00 00 00 01 00 03 00 03 00 01 00 00"), &out), kStatusOutOfMemory);
+  // An unknown code.
+  EXPECT_EQ(Load(FromHex("00 00 00 01 00 04 00 EE 00 01 00 00"), &out), kStatusOutOfMemory);
+  EXPECT_TRUE(capture.Contains("ConstructEltTD(): type code 238 is invalid.")) << ::testing::PrintToString(capture.Texts());
+  // Truncated in the middle of a record.
+  EXPECT_EQ(Load(FromHex("00 00 00 01 00 08 00 30 FF FF"), &out), kStatusOutOfMemory);
+  // A container whose element index is outside the table.
+  EXPECT_EQ(Load(FromHex("00 00 00 01 00 06 00 40 00 01 FF FF FF FF 00 05 00 01 00 00"), &out),
+            kStatusOutOfMemory);
+  // An entry index outside the table is the null descriptor.
+  ASSERT_EQ(Load(FromHex("00 00 00 01 00 05 00 03 00 00 01 00 07"), &out), kStatusNoError);
+  EXPECT_FALSE(out);
+  // More than one entry for one type.
+  capture.Clear();
+  EXPECT_EQ(Load(FromHex("00 00 00 01 00 05 00 03 00 00 02 00 00 00 00"), &out), kStatusNullHandle);
+  EXPECT_TRUE(capture.Contains("UnFlattenOneType : We're only supposed to have one type."));
+  // Counts far beyond the input reserve nothing they cannot fill.
+  EXPECT_EQ(Load(FromHex("FF FF FF FF 00 05"), &out), kStatusOutOfMemory);
+  TMTypeList list;
+  const std::vector<uint8_t> manyEntries = FromHex("00 00 00 00 7F FF");
+  EXPECT_EQ(UnFlattenListOfTypes(nullptr, manyEntries.data(), 6, &list, nullptr, 0, nullptr), kStatusOutOfMemory);
+  EXPECT_EQ(UnFlattenListOfTypes(nullptr, manyEntries.data(), 6, nullptr, nullptr, 0, nullptr), kStatusBadArgument);
+}
+
+TEST_F(TD80ReadWriteTest, NullOutputHandleIsRefused) {
+  DebugCapture capture;
+  TMTypeList list;
+  EXPECT_EQ(FlattenListOfTypes(nullptr, &list, nullptr, nullptr, 0, nullptr, 0), kStatusNullHandle);
+  EXPECT_TRUE(capture.Contains("FlattenListOfTypes : Do not pass hdl as NULL in FlattenListOfTypes"));
+}
+
+TEST_F(TD80ReadWriteTest, SanityCheckIsReportedButDoesNotStopTheSave) {
+  DebugCapture capture;
+  SetTDSanityCheckProc([](const TD&) -> int32_t { return 0; });
+  TDR back = RoundTrip(GetiL());
+  SetTDSanityCheckProc(nullptr);
+  EXPECT_EQ(back, GetiL());
+  EXPECT_TRUE(capture.Contains("Saving an insane type descriptor."));
+  EXPECT_TRUE(capture.Contains("UnFlattenListOfTypes : Loading an insane type descriptor."));
+}
+
+// --- versions ----------------------------------------------------------------------------------------
+
+TEST(KoCMutateTest, VersionRulesAcrossBranches) {
+  for (const uint32_t m : {0x08604012u, 0x22302005u, 0u}) EXPECT_FALSE(VersionShouldMutate(0x22308000, m, 0x22308000));
+  // The change of 8.6 build 4012 reached 9.0 in build 2006.
+  EXPECT_TRUE(VersionShouldMutate(0x09002005, 0x08604012, 0x22308000));
+  EXPECT_FALSE(VersionShouldMutate(0x09002006, 0x08604012, 0x22308000));
+  // Branches that no row pairs compare as numbers.
+  EXPECT_TRUE(VersionShouldMutate(0x21009000, 0x22302005, 0x22308000));
+  EXPECT_FALSE(VersionShouldMutate(0x22303000, 0x22302005, 0x22308000));
+  // A change later than every pair of its row reached the newer branch only after the current build.
+  EXPECT_TRUE(VersionShouldMutate(0x22308000, 0x21009000, 0x22308001));
+  // Row 13's second pair is reached only above the first limit.
+  EXPECT_TRUE(VersionShouldMutate(0x10002009, 0x09006000, 0x22308000));
+  EXPECT_FALSE(VersionShouldMutate(0x10002010, 0x09006000, 0x22308000));
+
+  EXPECT_EQ(GetBranchCompatibleVersion(0x21005000, 0x22308000), 0x22302000u);
+  EXPECT_EQ(GetBranchCompatibleVersion(0x21009000, 0x22308000), 0x22308001u);
+  EXPECT_EQ(GetBranchCompatibleVersion(0x20005000, 0x22308000), 0x20005000u);
+  EXPECT_EQ(GetBranchCompatibleVersion(0x21005000), 0x22302000u);
+
+  DebugCapture capture;
+  EXPECT_TRUE(VersionShouldMutate(0x30000000, 0x30000001, 0x30005000));
+  EXPECT_EQ(GetBranchCompatibleVersion(0x21005000, 0x30005000), 0x21005000u);
+  EXPECT_EQ(capture.Texts(),
+            (std::vector<std::string>{
+                "Version tables need to be updated for VersionShouldMutate for this branch: 0x30005000",
+                "Version tables need to be updated for GetBranchCompatibleVersion for this branch: 0x30005000"}));
+}
+
+}  // namespace
