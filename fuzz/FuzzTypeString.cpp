@@ -1,0 +1,64 @@
+// Reads arbitrary bytes as a type string, for the running version and for one before the flag
+// byte and qualified typedef names existed. Whatever is accepted must save to a type string that
+// loads back as the same interned descriptors and saves to the same bytes again; nothing may leak
+// once the type manager has stopped.
+#include <cstdint>
+#include <cstdlib>
+#include <cstring>
+
+#include "runtime/DSMemory.h"
+#include "runtime/DebugStream.h"
+#include "runtime/PXServices.h"
+#include "vellum.h"
+
+namespace {
+
+bool SameBytes(UHandle a, UHandle b) {
+  const size_t size = DSGetHandleSize(a);
+  return size == DSGetHandleSize(b) && std::memcmp(*a, *b, size) == 0;
+}
+
+void CheckRoundTrip(const uint8_t* data, size_t size, uint32_t version) {
+  const PersistTDData persist(version);
+  TMTypeList first;
+  if (UnFlattenListOfTypes(&persist, data, static_cast<uint32_t>(size), &first, nullptr, 0, nullptr) != 0) return;
+  for (int32_t i = 0; i < first.GetNumTypes(); ++i)
+    if (!first.GetType(static_cast<uint32_t>(i))) return;  // a list with holes has no saved form
+
+  UHandle saved = nullptr;
+  if (FlattenListOfTypes(&persist, &first, nullptr, &saved, 0, nullptr, 0) != 0) std::abort();
+  TMTypeList second;
+  if (UnFlattenListOfTypes(&persist, saved, &second, nullptr, 0, nullptr) != 0) std::abort();
+  if (second.GetNumTypes() != first.GetNumTypes()) std::abort();
+  for (int32_t i = 0; i < first.GetNumTypes(); ++i)
+    if (!(second.GetType(static_cast<uint32_t>(i)) == first.GetType(static_cast<uint32_t>(i)))) std::abort();
+  UHandle again = nullptr;
+  if (FlattenListOfTypes(&persist, &second, nullptr, &again, 0, nullptr, 0) != 0) std::abort();
+  if (!SameBytes(saved, again)) std::abort();
+  DSDisposeHandle(saved);
+  DSDisposeHandle(again);
+}
+
+}  // namespace
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+  // One start and stop first, so that what lives as long as the process exists before counting.
+  static const bool ready = [] {
+    SetDebugSink([](const DebugMessage&) {});
+    ServiceManager services;
+    if (services.Start(TypeManagerService()) != 0) std::abort();
+    services.StopAll();
+    return true;
+  }();
+  (void)ready;
+  const int64_t liveBefore = DSLiveBlockCount();
+  {
+    ServiceManager services;
+    if (services.Start(TypeManagerService()) != 0) std::abort();
+    CheckRoundTrip(data, size, 0x22308000);
+    CheckRoundTrip(data, size, 0x08600000);
+    services.StopAll();
+  }
+  if (DSLiveBlockCount() != liveBefore) std::abort();
+  return 0;
+}
