@@ -17,7 +17,6 @@
 
 namespace {
 
-std::atomic<int32_t> gDSAlign{0};
 
 // The shared default getter of each code, filled by the families as they load.
 std::array<std::atomic<DefaultTypeGetter>, 256>& DefaultGetters() {
@@ -488,9 +487,10 @@ void ToDebugStream(DebugStream& stream, const TD& type) {
   stream << "\"]";
 }
 
-void SetDSAlign(int32_t alignment) { gDSAlign.store(alignment, std::memory_order_relaxed); }
+std::atomic<int32_t> vellum::detail::gDSAlign{0};
 
-int32_t GetDSAlign() { return gDSAlign.load(std::memory_order_relaxed); }
+void SetDSAlign(int32_t alignment) { vellum::detail::gDSAlign.store(alignment, std::memory_order_relaxed); }
+
 
 const TypeCodeInfo* FindTypeCode(int32_t raw) {
   for (const TypeCodeInfo& info : kTypeCodes) {

@@ -205,5 +205,10 @@ void TDImpClearMemory(void* data, const TDImp* type, int32_t clear);
 // Appends `[TD "name"]` to the stream.
 void ToDebugStream(DebugStream& stream, const TD& type);
 
+namespace vellum::detail {
+extern std::atomic<int32_t> gDSAlign;
+}  // namespace vellum::detail
+
 // The running process's largest alignment (SetDSAlign); 0, packed, until the host sets it.
-int32_t GetDSAlign();
+// Inline: every layout question and every cluster copy asks it.
+inline int32_t GetDSAlign() { return vellum::detail::gDSAlign.load(std::memory_order_relaxed); }
