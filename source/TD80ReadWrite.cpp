@@ -352,9 +352,11 @@ int32_t FlattenListOfTypes(const PersistTDData* persist, const TMTypeList* list,
 int32_t FlattenOneType(const PersistTDData* persist, const TDR& type, UHandle* outHandle,
                        const Endianizer* endianizer) {
   TMTypeList list;
+  if (!list.IsValid()) return kStatusOutOfMemory;
   if (type) {
     uint32_t position = 0;
-    if (const int32_t status = list.AppendType(type, &position); status != kStatusNoError) return status;
+    // A valid list refuses only when it cannot grow.
+    if (list.AppendType(type, &position) != kStatusNoError) return kStatusOutOfMemory;
   }
   return FlattenListOfTypes(persist, &list, nullptr, outHandle, 1, endianizer, 0);
 }
@@ -373,9 +375,11 @@ int32_t SaveListOfTypes(const PersistTDData* persist, int32_t fileRef, uint32_t 
 int32_t SaveListOfOneType(const PersistTDData* persist, int32_t fileRef, uint32_t resId, uint32_t resType,
                           const TDR& type) {
   TMTypeList list;
+  if (!list.IsValid()) return kStatusOutOfMemory;
   if (type) {
     uint32_t position = 0;
-    if (const int32_t status = list.AppendType(type, &position); status != kStatusNoError) return status;
+    // A valid list refuses only when it cannot grow.
+    if (list.AppendType(type, &position) != kStatusNoError) return kStatusOutOfMemory;
   }
   return SaveListOfTypes(persist, fileRef, resId, resType, &list, nullptr, 1, 0);
 }
@@ -489,6 +493,7 @@ int32_t UnFlattenOneType(const PersistTDData* persist, const uint8_t* data, uint
                          const Endianizer* endianizer) {
   if (out == nullptr) return kStatusBadArgument;
   TMTypeList list;
+  if (!list.IsValid()) return kStatusOutOfMemory;
   if (const int32_t status = UnFlattenListOfTypes(persist, data, size, &list, nullptr, 1, endianizer);
       status != kStatusNoError)
     return status;

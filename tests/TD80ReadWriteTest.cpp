@@ -11,6 +11,7 @@
 #include "TypeSystemFixture.h"
 #include "runtime/PXApp.h"
 #include "runtime/PXResources.h"
+#include "source/KoDataReader.h"
 #include "vellum.h"
 #include "vellum/TypeStrings.h"
 
@@ -279,6 +280,117 @@ TEST_F(TD80ReadWriteTest, SanityCheckIsReportedButDoesNotStopTheSave) {
   EXPECT_EQ(back, GetiL());
   EXPECT_TRUE(capture.Contains("Saving an insane type descriptor."));
   EXPECT_TRUE(capture.Contains("UnFlattenListOfTypes : Loading an insane type descriptor."));
+}
+
+// --- consolidated types, types inside data -----------------------------------------------------------
+
+TEST_F(TD80ReadWriteTest, ConsolidatedListsReferToTheSharedList) {
+  TMTypeList shared;
+  const PersistTDData persist(&shared, nullptr, PXApp::Instance().GetVersion(), 0);
+  ASSERT_TRUE(persist.PersistingWithConsolidatedTypes());
+  TMTypeList list;
+  list.AppendType(GetiL(), nullptr);
+  list.AppendType(GetfD(), nullptr);
+  UHandle h = nullptr;
+  ASSERT_EQ(FlattenListOfTypes(&persist, &list, nullptr, &h, 0, nullptr, 0), kStatusNoError);
+  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)), "00 02 00 01");
+  ASSERT_EQ(shared.GetNumTypes(), 2);
+  DSDisposeHandle(h);
+  // The same run again is found where it stands; a one-type reference has no count.
+  TMTypeList second;
+  second.AppendType(GetfD(), nullptr);
+  ASSERT_EQ(FlattenListOfTypes(&persist, &second, nullptr, &h, 1, nullptr, 0), kStatusNoError);
+  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)), "00 02");
+  EXPECT_EQ(shared.GetNumTypes(), 2);
+  TDR back;
+  ASSERT_EQ(UnFlattenOneType(&persist, h, &back, nullptr), kStatusNoError);
+  EXPECT_EQ(back, GetfD());
+  DSDisposeHandle(h);
+
+  // Without consolidation (an old version, or suppressed) the ordinary form is written.
+  const PersistTDData old(&shared, nullptr, 0x08602038, 0);
+  EXPECT_FALSE(old.PersistingWithConsolidatedTypes());
+  const PersistTDData suppressed(&shared, nullptr, PXApp::Instance().GetVersion(), kPersistSuppressConsolidation);
+  EXPECT_FALSE(suppressed.PersistingWithConsolidatedTypes());
+}
+
+TEST_F(TD80ReadWriteTest, DeferredReferencesPassThroughThePendingQueue) {
+  DebugCapture capture;
+  const PersistTDData persist(nullptr, nullptr, PXApp::Instance().GetVersion(), kPersistDeferIndices);
+  TMTypeList read;
+  const std::vector<uint8_t> bytes = FromHex("00 05");
+  ASSERT_EQ(UnFlattenListOfTypes(&persist, bytes.data(), 2, &read, nullptr, 1, nullptr), kStatusNoError);
+  TMTypeList list;
+  list.AppendType(GetiL(), nullptr);
+  UHandle h = nullptr;
+  ASSERT_EQ(FlattenListOfTypes(&persist, &list, nullptr, &h, 1, nullptr, 0), kStatusNoError);
+  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)), "00 05");
+  DSDisposeHandle(h);
+  // The queue is empty now.
+  EXPECT_EQ(FlattenListOfTypes(&persist, &list, nullptr, &h, 1, nullptr, 0), kStatusNullHandle);
+  EXPECT_TRUE(capture.Contains("invalid call"));
+}
+
+TEST_F(TD80ReadWriteTest, TypesInsideDataAndTheOldFormatHooks) {
+  OutputBuf out;
+  {
+    KoDataWriter writer(&out, PXApp::Instance().GetVersion(), nullptr, 0);
+    ASSERT_EQ(writer.WriteTD(GetStringTD()), kStatusNoError);
+  }
+  EXPECT_EQ(Hex(out.Data(), out.GetBytesWritten()), "00 00 00 01 00 08 00 30 FF FF FF FF 00 01 00 00");
+  InputBuf in(out.Data(), out.GetBytesWritten());
+  KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
+  EXPECT_EQ(reader.ReadTD(), GetStringTD());
+  EXPECT_EQ(reader.BytesLeft(), 0u);
+
+  // Descriptors in data older than 0x08002184 belong to the host's procedures.
+  SetWriteOldTDProc([](KoDataWriter* writer, const TDR& type) -> uint32_t {
+    return static_cast<uint32_t>(writer->WriteU8(static_cast<uint8_t>(type.GetTypeCode())));
+  });
+  SetReadOldTDProc([](KoDataReader* source) -> TDR {
+    uint8_t code = 0;
+    source->ReadU8(&code);
+    return MakeDefaultTDRForTypeCode(code);
+  });
+  OutputBuf old;
+  {
+    KoDataWriter writer(&old, 0x07000000, nullptr, 0);
+    ASSERT_EQ(writer.WriteTD(GetfD()), kStatusNoError);
+  }
+  EXPECT_EQ(Hex(old.Data(), old.GetBytesWritten()), "0A");
+  InputBuf oldIn(old.Data(), old.GetBytesWritten());
+  KoDataReader oldReader(&oldIn, 0x07000000, nullptr, nullptr, 0);
+  EXPECT_EQ(oldReader.ReadTD(), GetfD());
+  SetWriteOldTDProc(nullptr);
+  SetReadOldTDProc(nullptr);
+
+  DebugCapture capture;
+  OutputBuf none;
+  KoDataWriter writer(&none, 0x07000000, nullptr, 0);
+  EXPECT_EQ(writer.WriteTD(GetfD()), kStatusNullHandle);
+  EXPECT_TRUE(capture.Contains("No callback to write old TD"));
+}
+
+TEST_F(TD80ReadWriteTest, AllocationFailuresLeaveNothingBehind) {
+  TDWCluster cluster;
+  cluster << GetiL() << TDRArray(1, GetStringTD());
+  cluster.SetName("sweep");
+  const TDR type = cluster.CheckIn();
+  SweepAllocationFailures(kStatusOutOfMemory, [&] {
+    UHandle h = nullptr;
+    const int32_t status = FlattenOneType(nullptr, type, &h, nullptr);
+    if (status == kStatusNoError) DSDisposeHandle(h);
+    return status;
+  });
+  UHandle h = nullptr;
+  ASSERT_EQ(FlattenOneType(nullptr, type, &h, nullptr), kStatusNoError);
+  SweepAllocationFailures(kStatusOutOfMemory, [&] {
+    TDR back;
+    const int32_t status = UnFlattenOneType(nullptr, h, &back, nullptr);
+    if (status == kStatusNoError && !(back == type)) return -1;
+    return status;
+  });
+  DSDisposeHandle(h);
 }
 
 // --- versions ----------------------------------------------------------------------------------------
