@@ -64,7 +64,6 @@ class TDDataReader : public KoDataReader {
   // A VSF index read from the stream and that load-table entry; the null descriptor outside.
   TDImpPtr RetrieveTDFromLoadTable();
   const TDR& GetTypeRef();
-  TDR GetType() { return GetTypeRef(); }
   // The entry at `index`; outside the table, "Invalid type index: " (level 2) and null.
   const TDR& RetrieveTDFromLoadTableByIndex(int32_t index);
   int32_t GetLoadTableSize() const { return static_cast<int32_t>(table_.size()); }
