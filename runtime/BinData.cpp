@@ -88,6 +88,23 @@ int32_t OutputBuf::Write(const void* p, size_t n) {
   return kStatusNoError;
 }
 
+uint8_t* OutputBuf::Extend(size_t n) {
+  const size_t at = bytes_.size();
+  try {
+    bytes_.resize(at + n);
+  } catch (const std::bad_alloc&) {
+    return nullptr;
+  } catch (const std::length_error&) {
+    return nullptr;
+  }
+  return bytes_.data() + at;
+}
+
+uint8_t* PreflightOutputBuf::Extend(size_t n) {
+  count_ += n;
+  return nullptr;
+}
+
 int32_t OutputBuf::Overwrite(size_t position, const void* p, size_t n) {
   if (n == 0) return kStatusNoError;
   if (p == nullptr || position > bytes_.size() || n > bytes_.size() - position) return kStatusBadArgument;
@@ -359,3 +376,138 @@ int32_t BinDataReader::Skip(size_t n) {
 }
 
 int32_t BinDataReader::Align(size_t n) { return Skip(PaddingTo(Position(), n)); }
+
+// --- runs of values and extended precision ---------------------------------------------------------
+
+namespace {
+
+uint16_t SwapAny(uint16_t v) { return Swap16(v); }
+uint32_t SwapAny(uint32_t v) { return Swap32(v); }
+uint64_t SwapAny(uint64_t v) { return Swap64(v); }
+
+template <class T>
+void SwapRun(uint8_t* dst, const uint8_t* src, size_t count) {
+  for (size_t i = 0; i < count; ++i) {
+    T v;
+    std::memcpy(&v, src + i * sizeof(T), sizeof(T));
+    v = SwapAny(v);
+    std::memcpy(dst + i * sizeof(T), &v, sizeof(T));
+  }
+}
+
+// Copies `count` values of `size` bytes, reversing each one's bytes when `swap` is set.
+void ConvertRun(uint8_t* dst, const uint8_t* src, size_t size, size_t count, bool swap) {
+  if (!swap || size == 1) {
+    std::memcpy(dst, src, size * count);
+    return;
+  }
+  switch (size) {
+    case 2: SwapRun<uint16_t>(dst, src, count); break;
+    case 4: SwapRun<uint32_t>(dst, src, count); break;
+    default: SwapRun<uint64_t>(dst, src, count); break;
+  }
+}
+
+constexpr uint64_t kIntegerBit = uint64_t{1} << 63;
+
+// The integer bit every canonical value with this exponent field has.
+bool CanonicalIntegerBit(uint16_t exponent) { return exponent != 0; }
+
+}  // namespace
+
+int32_t BinDataWriter::WriteValues(const void* p, size_t size, size_t count) {
+  if (status_ != 0) return status_;
+  if (count == 0) return status_;
+  if (!out_) {
+    SetError(kStatusNullHandle);
+    return status_;
+  }
+  if (size != 1 && size != 2 && size != 4 && size != 8) {
+    SetError(kStatusBadArgument);
+    return status_;
+  }
+  if (count > std::numeric_limits<size_t>::max() / size) {
+    SetError(kStatusOutOfMemory);
+    return status_;
+  }
+  if (out_->IsCounting()) {
+    out_->Extend(size * count);
+    return status_;
+  }
+  uint8_t* into = out_->Extend(size * count);
+  if (into == nullptr) {
+    SetError(kStatusOutOfMemory);
+    return status_;
+  }
+  ConvertRun(into, static_cast<const uint8_t*>(p), size, count, endianizer_->Swaps());
+  return status_;
+}
+
+int32_t BinDataReader::ReadValues(void* dst, size_t size, size_t count) {
+  if (count == 0) return status_;
+  const bool fits = size != 0 && count <= std::numeric_limits<size_t>::max() / size;
+  const size_t bytes = fits ? size * count : 0;
+  if (status_ == 0 && (!in_ || !fits || in_->BytesLeft() < bytes)) SetError(in_ ? kStatusCorruptData : kStatusNullHandle);
+  if (status_ != 0) {
+    if (dst && fits) std::memset(dst, 0, bytes);
+    return status_;
+  }
+  ConvertRun(static_cast<uint8_t*>(dst), in_->Data() + in_->Position(), size, count, endianizer_->Swaps());
+  in_->Skip(bytes);
+  return status_;
+}
+
+int32_t BinDataWriter::WriteExtended(const uint8_t* ten) {
+  uint64_t significand = 0;
+  uint16_t signExponent = 0;
+  std::memcpy(&significand, ten, 8);
+  std::memcpy(&signExponent, ten + 8, 2);
+  if constexpr (std::endian::native == std::endian::big) {
+    significand = Swap64(significand);
+    signExponent = Swap16(signExponent);
+  }
+  const uint16_t exponent = signExponent & 0x7FFF;
+  const bool integerBit = (significand & kIntegerBit) != 0;
+  const uint64_t fraction = significand & ~kIntegerBit;
+  // binary128: sign and exponent in the top 16 bits, then the 63 fraction bits, then zeros.
+  const uint64_t high = (static_cast<uint64_t>(signExponent) << 48) | (fraction >> 15);
+  uint64_t low = fraction << 49;
+  if (integerBit != CanonicalIntegerBit(exponent)) low |= 1;
+  if (endianizer_->IsBigEndian()) {
+    WriteU64(high);
+    return WriteU64(low);
+  }
+  WriteU64(low);
+  return WriteU64(high);
+}
+
+int32_t BinDataReader::ReadExtended(uint8_t* ten) {
+  uint64_t high = 0;
+  uint64_t low = 0;
+  if (endianizer_->IsBigEndian()) {
+    ReadU64(&high);
+    ReadU64(&low);
+  } else {
+    ReadU64(&low);
+    ReadU64(&high);
+  }
+  if (status_ != 0) {
+    std::memset(ten, 0, 10);
+    return status_;
+  }
+  uint16_t signExponent = static_cast<uint16_t>(high >> 48);
+  const uint16_t exponent = signExponent & 0x7FFF;
+  // Fraction bits below the 63 an extended value has are dropped (a binary128 value written by
+  // another producer is rounded toward zero), except the marker bit.
+  const uint64_t fraction = ((high & 0xFFFFFFFFFFFFull) << 15) | (low >> 49);
+  bool integerBit = CanonicalIntegerBit(exponent);
+  if ((low & 1) != 0) integerBit = !integerBit;
+  uint64_t significand = fraction | (integerBit ? kIntegerBit : 0);
+  if constexpr (std::endian::native == std::endian::big) {
+    significand = Swap64(significand);
+    signExponent = Swap16(signExponent);
+  }
+  std::memcpy(ten, &significand, 8);
+  std::memcpy(ten + 8, &signExponent, 2);
+  return status_;
+}

@@ -24,6 +24,9 @@ class Endianizer {
   double StreamF64(double v) const;
   // True when the stream's order differs from the machine's.
   bool Swaps() const;
+  // The bytes of one flattened extended-precision value (see BinDataWriter::WriteExtended).
+  static constexpr size_t kExtendedSize = 16;
+  size_t ExtendedSize() const { return kExtendedSize; }
 };
 
 // Every flattened format of this library is big-endian.
@@ -67,6 +70,9 @@ class OutputBuf {
   virtual int32_t Write(const void* p, size_t n);
   virtual size_t GetBytesWritten() const;
   virtual bool IsCounting() const { return false; }
+  // Appends n bytes and gives where they start, for the caller to fill; null when memory runs
+  // out (nothing appended) or for a counting buffer, which only counts them.
+  virtual uint8_t* Extend(size_t n);
   // Replaces n bytes written earlier, from `position` on; 1 when they were not all written yet
   // (a counting buffer accepts any).
   virtual int32_t Overwrite(size_t position, const void* p, size_t n);
@@ -87,6 +93,7 @@ class PreflightOutputBuf : public OutputBuf {
   size_t GetBytesWritten() const override { return count_; }
   bool IsCounting() const override { return true; }
   int32_t Overwrite(size_t, const void*, size_t) override { return 0; }
+  uint8_t* Extend(size_t n) override;
 
  private:
   size_t count_ = 0;
@@ -116,6 +123,16 @@ class BinDataWriter {
   // 32-bit count and bytes; null writes count 0; a negative count is error 1.
   int32_t WriteLStr(LStrHandle h);
   int32_t WriteBytes(const void* p, size_t n);
+  // `count` values of `size` bytes each (1, 2, 4 or 8), in the stream's order, in one piece.
+  int32_t WriteValues(const void* p, size_t size, size_t count);
+  // An 80-bit extended value (10 bytes as PXNumbers.h stores them) in 16 bytes: the IEEE
+  // binary128 value that equals it, written as two 64-bit halves in the stream's order (high
+  // half first when big-endian). Every 80-bit value has one: the exponent bias is the same and the
+  // 63 fraction bits lead the 112; only an integer bit that disagrees with the exponent (the
+  // unnormal and pseudo-denormal encodings, which binary128 cannot express) is kept apart, in
+  // the lowest fraction bit, which is zero for every value that binary128 can hold. Reading
+  // restores all 80 bits exactly.
+  int32_t WriteExtended(const uint8_t* ten);
   // The flattened form of PXPath.h; a null path is written as not-a-path.
   int32_t WritePath(Path p);
   // Zero bytes up to a multiple of n bytes from the start of the buffer (n 0 or 1: nothing).
@@ -165,6 +182,10 @@ class BinDataReader {
   // bytes left is 74. On failure a live *h is left as the empty string, anything else as null.
   int32_t ReadLStr(LStrHandle* h);
   int32_t ReadBytes(void* dst, size_t n);
+  // `count` values of `size` bytes each (1, 2, 4 or 8) into native order; zeros on failure.
+  int32_t ReadValues(void* dst, size_t size, size_t count);
+  // The 16-byte form WriteExtended writes, into 10 bytes; zeros on failure.
+  int32_t ReadExtended(uint8_t* ten);
   // *p receives a new path owned by the caller (null on failure); the old value is overwritten.
   int32_t ReadPath(Path* p);
   int32_t Skip(size_t n);

@@ -2,8 +2,11 @@
 // format being read, the persist context, options and the variable-size field.
 #include "source/KoDataReader.h"
 
+#include <algorithm>
+
 #include "runtime/DebugStream.h"
 #include "runtime/PXApp.h"
+#include "source/TD.h"
 #include "source/TD80ReadWrite.h"
 
 KoDataReader::KoDataReader(InputBuf* in, uint32_t version, const KoContext* context,
@@ -18,6 +21,47 @@ KoDataReader::KoDataReader(const PersistTDData* persist, InputBuf* in,
       own_(persist ? *persist : PersistTDData(PXApp::Instance().GetVersion())) {}
 
 KoDataReader::~KoDataReader() = default;
+
+namespace {
+
+constexpr uint32_t kOneByteBooleanVersion = 0x04502004;
+constexpr uint64_t kAllocationAllowance = uint64_t{2} << 20;
+constexpr uint64_t kAllocationPerInputByte = 32;
+
+}  // namespace
+
+uint8_t KoDataReader::ReadBool() {
+  if (GetVersion() < kOneByteBooleanVersion) {
+    uint16_t word = 0;
+    ReadU16(&word);
+    return (word & 0x8000) != 0 ? 1 : 0;
+  }
+  uint8_t byte = 0;
+  ReadU8(&byte);
+  return byte != 0 ? 1 : 0;
+}
+
+int32_t KoDataReader::ReadData(const TD& type, void* data, int32_t count) {
+  if (!type) {
+    SetError(kStatusNullHandle);
+    return GetError();
+  }
+  int32_t status = GetError();
+  type.GetImp()->ReadData(this, data, count, &status);
+  SetError(status);
+  return GetError();
+}
+
+bool KoDataReader::MayAllocate(uint64_t bytes) {
+  const uint64_t left = BytesLeft();
+  const uint64_t limit = std::max(kAllocationAllowance, left * kAllocationPerInputByte);
+  if (bytes <= limit) return true;
+  (VELLUM_DEBUG(2) << "ReadData refused an allocation of " << bytes
+                   << " bytes: more than max(2 MiB, 32 x the " << left << " bytes of input left)")
+      .Process();
+  SetError(kStatusImplausibleData);
+  return false;
+}
 
 int32_t KoDataReader::ReadVariableSizeField(int32_t* value) {
   if (value) *value = 0;

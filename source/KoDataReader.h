@@ -42,6 +42,19 @@ class KoDataReader : public BinDataReader {
   // ((first & 0x7FFF) << 16) | second. `value` may be null to skip the field; on failure it is 0.
   int32_t ReadVariableSizeField(int32_t* value);
 
+  // As KoDataWriter::WriteBool wrote it: true for a nonzero byte, or for bit 15 of the old word.
+  uint8_t ReadBool();
+
+  // `count` values of `type` into `data` (which holds default data of the type, or null to skip
+  // the values); the stream's status. A failed read leaves the values cleared or default and
+  // releases what it allocated.
+  int32_t ReadData(const TD& type, void* data, int32_t count);
+
+  // Whether a read may allocate `bytes` now: a single allocation may take no more than
+  // max(2 MiB, 32 x the input left), so that memory follows what the input pays for. A refusal
+  // is status 116 with a message naming the limit.
+  bool MayAllocate(uint64_t bytes);
+
   // A descriptor inside data, as WriteTD wrote it; the null descriptor on failure (or for a
   // string with no entry). More than one entry is 74.
   TDR ReadTD();

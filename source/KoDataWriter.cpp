@@ -8,12 +8,15 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXApp.h"
 #include "source/KoCMutate.h"
+#include "source/TD.h"
 #include "vellum/TypeStrings.h"
 
 namespace {
 
 constexpr int32_t kLargestShortSizeField = 0x7FFF;
 
+// Booleans took a 16-bit word before this version.
+constexpr uint32_t kOneByteBooleanVersion = 0x04502004;
 // Descriptors inside data of older versions belong to the host's old-format procedures.
 constexpr uint32_t kVariantVersionWordVersion = 0x08002184;
 // Consolidated types were first written by this version.
@@ -130,7 +133,22 @@ int32_t KoDataWriter::GetSizeOfVariableSizeField(int32_t value) {
   return value <= kLargestShortSizeField ? 2 : 4;
 }
 
-int32_t KoDataWriter::WriteBool(bool value) { return WriteU8(value ? 1 : 0); }
+int32_t KoDataWriter::WriteBool(bool value) {
+  if (GetVersion() < kOneByteBooleanVersion) return WriteU16(value ? 0x8000 : 0);
+  return WriteU8(value ? 1 : 0);
+}
+
+int32_t KoDataWriter::WriteData(const TD& type, const void* data, int32_t count) {
+  if (GetError() != kStatusNoError) return GetError();
+  if (!type) {
+    SetError(kStatusNullHandle);
+    return GetError();
+  }
+  int32_t status = kStatusNoError;
+  type.GetImp()->WriteData(this, data, count, &status);
+  SetError(status);
+  return GetError();
+}
 
 int32_t KoDataWriter::WriteTD(const TDR& type) {
   if (GetError() != kStatusNoError) return GetError();

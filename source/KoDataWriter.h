@@ -123,8 +123,11 @@ class KoDataWriter : public BinDataWriter {
   // The bytes WriteVariableSizeField writes for `value`: 2 or 4.
   static int32_t GetSizeOfVariableSizeField(int32_t value);
 
-  // One byte, 1 for true and 0 for false.
+  // One byte, 1 for true and 0 for false; before 0x04502004 a 16-bit word, 0x8000 for true.
   int32_t WriteBool(bool value);
+
+  // `count` values of `type` from `data` in their flattened form; the stream's status.
+  int32_t WriteData(const TD& type, const void* data, int32_t count);
 
   // A descriptor inside data: its one-entry type string (the host's writer for versions before
   // 0x08002184). The flattening's status becomes the stream's.

@@ -9,6 +9,7 @@
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
 #include "source/CoreTDTable.h"
+#include "source/KoCMutate.h"
 #include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
@@ -305,18 +306,65 @@ int32_t TDImp::InflateDefData(void* data, int32_t onlyIfEmpty, int32_t clearFirs
 
 DataShapes TDImp::DataShapeOf(int32_t) const { return kDataShapePlain; }
 
-uint32_t TDImp::FlatDataSize(KoDataWriter*, const void*) const {
+// --- flattened data --------------------------------------------------------------------------------
+
+namespace {
+
+// Before this version a raw pointer took four zero bytes in flattened data.
+constexpr uint32_t kPointerPlaceholderVersion = 0x08602026;
+
+// Pointers into the writer's memory mean nothing to a reader, and one taken from input would point
+// anywhere: such data travel as nothing (or the old placeholder) and read back cleared.
+bool HoldsRawPointer(const TDImp& type) {
+  return type.IsPtr() != 0 || type.IsCStr() != 0 || type.IsPStr() != 0 || type.IsPtrTo() != 0 ||
+         type.IsArrayDataPtr() != 0;
+}
+
+bool WritesPointerPlaceholder(uint32_t version) { return VersionShouldMutate(version, kPointerPlaceholderVersion); }
+
+}  // namespace
+
+uint32_t TDImp::FlatDataSize(KoDataWriter* writer, const void*) const {
+  if (HoldsRawPointer(*this))
+    return writer != nullptr && WritesPointerPlaceholder(writer->GetVersion()) ? 4 : 0;
   return static_cast<uint32_t>(DataSizeCore(nullptr));
 }
 
-int32_t TDImp::ReadData(KoDataReader*, void*, int32_t, int32_t* status) const {
-  if (status != nullptr) *status = kStatusNullHandle;
-  return kStatusNullHandle;
+// Fixed-size data without a form of its own: the bytes as they are in memory.
+int32_t TDImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  const size_t start = writer->GetBytesWritten();
+  if (count > 0 && writer->GetError() == kStatusNoError) {
+    if (HoldsRawPointer(*this)) {
+      if (WritesPointerPlaceholder(writer->GetVersion()))
+        for (int32_t i = 0; i < count; ++i) writer->WriteU32(0);
+    } else {
+      const auto bytes = static_cast<size_t>(DataSizeCore(nullptr)) * static_cast<size_t>(count);
+      if (data == nullptr && bytes != 0) {
+        writer->SetError(kStatusBadArgument);
+      } else {
+        writer->WriteBytes(data, bytes);
+      }
+    }
+  }
+  if (status != nullptr) *status = writer->GetError();
+  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDImp::WriteData(KoDataWriter*, const void*, int32_t, int32_t* status) const {
-  if (status != nullptr) *status = kStatusNullHandle;
-  return kStatusNullHandle;
+int32_t TDImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  const size_t start = reader->Position();
+  if (count > 0) {
+    const auto bytes = static_cast<size_t>(DataSizeCore(nullptr)) * static_cast<size_t>(count);
+    if (HoldsRawPointer(*this)) {
+      if (WritesPointerPlaceholder(reader->GetVersion())) reader->Skip(4 * static_cast<size_t>(count));
+      if (data != nullptr) std::memset(data, 0, bytes);
+    } else if (data != nullptr) {
+      reader->ReadBytes(data, bytes);
+    } else {
+      reader->Skip(bytes);
+    }
+  }
+  if (status != nullptr) *status = reader->GetError();
+  return static_cast<int32_t>(reader->Position() - start);
 }
 
 int32_t TDImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {

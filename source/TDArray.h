@@ -112,6 +112,12 @@ class TDArrayImp final : public TDArrayBaseImp {
   int32_t IsArray() const override { return 1; }
   int32_t IsArrayOnly() const override { return 1; }
   int32_t ResizeAsVector(void* data, int32_t count, void** firstElement) const override;
+  // Each value as its dimension sizes and then its elements in storage order. Reading refuses,
+  // before allocating, a count whose elements cannot fit in the input left (116), and keeps a
+  // bounded or fixed array in its preallocated block, cut to the bounds.
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
 
   // Resizes the block at *h for the dimension words `dims` and writes them: a null *h stays null
   // when every word is 0, and a count of 0 with a nonzero word keeps a block of words only.
@@ -144,6 +150,10 @@ class TDSubArrayImp final : public TDArrayBaseImp {
   int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
   int32_t IsArray() const override { return 1; }
   int32_t IsSubArrayOnly() const override { return 1; }
+  // Written as the array it views; never read ("ReadData does not handle subArrays!").
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsSubType() const override { return 1; }
 
  protected:

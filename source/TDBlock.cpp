@@ -10,6 +10,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXStrings.h"
+#include "source/KoDataReader.h"
 #include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TDDataManager.h"
@@ -705,4 +706,47 @@ int32_t TDRepeatedBlockImp::ConstructTD(TDDataReader* reader) {
   if (const int32_t status = reader->ReadU32(&count); status != kStatusNoError) return status;
   SetNumBlocks(count);
   return TDBlockContainerImp::ConstructTD(reader);
+}
+
+// --- flattened data --------------------------------------------------------------------------------
+
+namespace {
+
+// Values of a repeated block's element for `count` repeated blocks; 0 when they do not fit 31 bits.
+int32_t ElementValues(uint32_t blocks, int32_t count) {
+  const uint64_t values = static_cast<uint64_t>(blocks) * static_cast<uint64_t>(std::max(count, 0));
+  return values > static_cast<uint64_t>(std::numeric_limits<int32_t>::max()) ? -1 : static_cast<int32_t>(values);
+}
+
+}  // namespace
+
+uint32_t TDRepeatedBlockImp::FlatDataSize(KoDataWriter* writer, const void* data) const {
+  const TDImpPtr& element = GetElt();
+  if (!element) return 0;
+  if (data == nullptr) return static_cast<uint32_t>(std::min<uint64_t>(uint64_t{element->FlatDataSize(writer, nullptr)} * numBlocks_, UINT32_MAX));
+  const int64_t stride = element->DataSizeCore(nullptr);
+  uint64_t size = 0;
+  for (uint32_t k = 0; k < numBlocks_; ++k)
+    size += element->FlatDataSize(writer, static_cast<const uint8_t*>(data) + stride * k);
+  return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
+}
+
+int32_t TDRepeatedBlockImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  const int32_t values = ElementValues(numBlocks_, count);
+  if (!GetElt() || values < 0) {
+    writer->SetError(GetElt() ? kStatusBadArgument : kStatusNullHandle);
+    if (status != nullptr) *status = writer->GetError();
+    return 0;
+  }
+  return GetElt()->WriteData(writer, data, values, status);
+}
+
+int32_t TDRepeatedBlockImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  const int32_t values = ElementValues(numBlocks_, count);
+  if (!GetElt() || values < 0) {
+    reader->SetError(GetElt() ? kStatusImplausibleData : kStatusNullHandle);
+    if (status != nullptr) *status = reader->GetError();
+    return 0;
+  }
+  return GetElt()->ReadData(reader, data, values, status);
 }

@@ -182,6 +182,10 @@ class TDRepeatedBlockImp final : public TDBlockContainerImp {
   // The number of blocks, then the element's index.
   int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
   int32_t ConstructTD(TDDataReader* reader) override;
+  // The element's values, one per block.
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
 
   uint32_t GetNumBlocks() const noexcept { return numBlocks_; }
   void SetNumBlocks(uint32_t count);

@@ -3,6 +3,9 @@
 // clusters and vectors, compatibility, the factory, handles and the shared empty cluster.
 #include "source/TDCluster.h"
 
+#include "source/KoDataReader.h"
+#include "source/KoDataWriter.h"
+
 #include <algorithm>
 #include <cstring>
 #include <limits>
@@ -636,4 +639,63 @@ TDWCluster& TDWCluster::operator<<(const TD& element) {
 const TDR& GetClust0TD() {
   static GlobalTypeEntry entry;
   return SharedGlobalType(entry, [] { return TDImpPtr(MakeCounted<TDClusterImp>()); });
+}
+
+// --- flattened data --------------------------------------------------------------------------------
+
+template <class Visit>
+void TDClusterImp::ForEachElement(Visit visit) const {
+  if (HasRecordedLayout()) {
+    const int32_t count = GetNumElts();
+    for (int32_t i = 0; i < count; ++i) {
+      const TDImp* element = GetEltImpPtr(i).get();
+      if (element != nullptr && !visit(element, static_cast<int64_t>(offsets_[static_cast<size_t>(i)]))) return;
+    }
+    return;
+  }
+  EltCursor cursor(*this, nullptr);
+  while (cursor.Next())
+    if (cursor.Element() != nullptr && !visit(cursor.Element(), cursor.Offset())) return;
+}
+
+uint32_t TDClusterImp::FlatDataSize(KoDataWriter* writer, const void* data) const {
+  uint64_t size = 0;
+  ForEachElement([&](const TDImp* element, int64_t offset) {
+    size += element->FlatDataSize(writer, data != nullptr ? At(data, offset) : nullptr);
+    return true;
+  });
+  return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
+}
+
+int32_t TDClusterImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  const size_t start = writer->GetBytesWritten();
+  if (count > 0 && data == nullptr) writer->SetError(kStatusBadArgument);
+  const int64_t stride = DataSizeCore(nullptr);
+  for (int32_t v = 0; v < count && writer->GetError() == kStatusNoError; ++v) {
+    const uint8_t* value = At(data, stride * v);
+    ForEachElement([&](const TDImp* element, int64_t offset) {
+      int32_t elementStatus = kStatusNoError;
+      element->WriteData(writer, At(value, offset), 1, &elementStatus);
+      writer->SetError(elementStatus);
+      return writer->GetError() == kStatusNoError;
+    });
+  }
+  if (status != nullptr) *status = writer->GetError();
+  return static_cast<int32_t>(writer->GetBytesWritten() - start);
+}
+
+int32_t TDClusterImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  const size_t start = reader->Position();
+  const int64_t stride = DataSizeCore(nullptr);
+  for (int32_t v = 0; v < count && reader->GetError() == kStatusNoError; ++v) {
+    uint8_t* value = data != nullptr ? At(data, stride * v) : nullptr;
+    ForEachElement([&](const TDImp* element, int64_t offset) {
+      int32_t elementStatus = reader->GetError();
+      element->ReadData(reader, value != nullptr ? At(value, offset) : nullptr, 1, &elementStatus);
+      reader->SetError(elementStatus);
+      return reader->GetError() == kStatusNoError;
+    });
+  }
+  if (status != nullptr) *status = reader->GetError();
+  return static_cast<int32_t>(reader->Position() - start);
 }

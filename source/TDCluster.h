@@ -37,6 +37,10 @@ class TDClusterImp : public TDMultiContainerImp {
   int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;
   int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
   int32_t ResetToDefaultData(void* data) const override;
+  // The elements in order, each in its own flattened form, without the in-memory padding.
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const override;
   int32_t IsClust() const override { return 1; }
@@ -77,6 +81,9 @@ class TDClusterImp : public TDMultiContainerImp {
   // first other status.
   template <class Step>
   int32_t ForEachDataStep(Step step) const;
+  // Calls `visit(element, offset)` for each present element, in order, while it returns true.
+  template <class Visit>
+  void ForEachElement(Visit visit) const;
 
   // The layout of an interned cluster for the running process, made at check-in with the
   // SetDSAlign value then in force (-1: none); used only while that value holds.

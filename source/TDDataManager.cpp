@@ -124,3 +124,23 @@ void SetCopyDataConvertSourceContextForProbe(const KoContext* context) {
 const KoContext* GetCopyDataConvertSourceContextForProbe() {
   return gProbeSourceContext.load(std::memory_order_relaxed);
 }
+
+int32_t TD::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  if (writer == nullptr || !imp_) {
+    if (status != nullptr) *status = kStatusNullHandle;
+    return 0;
+  }
+  return imp_->WriteData(writer, data, count, status);
+}
+
+int32_t TD::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  if (reader == nullptr || !imp_) {
+    if (status != nullptr) *status = kStatusNullHandle;
+    return 0;
+  }
+  return imp_->ReadData(reader, data, count, status);
+}
+
+uint32_t TD::FlatDataSize(KoDataWriter* writer, const void* data) const {
+  return imp_ ? imp_->FlatDataSize(writer, data) : 0;
+}

@@ -14,6 +14,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
+#include "source/KoDataReader.h"
 #include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
@@ -1094,4 +1095,78 @@ int32_t TDBasicNumericImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
   }
   if (!VersionShouldMutate(writer->GetVersion(), kNumFlagsVersion)) writer->WriteU8(numFlags_);
   return writer->GetError();
+}
+
+// --- flattened data --------------------------------------------------------------------------------
+
+namespace {
+
+// How one value of a numeric code is laid out: `parts` values of `partSize` bytes, extended
+// values marked by a part size of 10.
+struct NumericParts {
+  size_t partSize;
+  size_t parts;
+};
+
+NumericParts PartsOf(int32_t code) {
+  switch (static_cast<TypeCode>(code & ~0x10)) {
+    case TypeCode::Int8:
+    case TypeCode::UInt8: return {1, 1};
+    case TypeCode::Int16:
+    case TypeCode::UInt16: return {2, 1};
+    case TypeCode::Int32:
+    case TypeCode::UInt32:
+    case TypeCode::Float32: return {4, 1};
+    case TypeCode::Int64:
+    case TypeCode::UInt64:
+    case TypeCode::Float64: return {8, 1};
+    case TypeCode::FloatExt: return {10, 1};
+    case TypeCode::Complex64: return {4, 2};
+    case TypeCode::Complex128: return {8, 2};
+    case TypeCode::ComplexExt: return {10, 2};
+    default: return {0, 0};
+  }
+}
+
+constexpr size_t kExtendedBytes = 10;
+
+}  // namespace
+
+uint32_t TDBasicNumericImp::FlatDataSize(KoDataWriter*, const void*) const {
+  const NumericParts parts = PartsOf(GetTypeCode());
+  const size_t size = parts.partSize == kExtendedBytes ? Endianizer::kExtendedSize : parts.partSize;
+  return static_cast<uint32_t>(size * parts.parts);
+}
+
+int32_t TDBasicNumericImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  const size_t start = writer->GetBytesWritten();
+  const NumericParts parts = PartsOf(GetTypeCode());
+  const size_t values = parts.parts * static_cast<size_t>(std::max(count, 0));
+  if (values != 0 && data == nullptr) writer->SetError(kStatusBadArgument);
+  if (parts.partSize == kExtendedBytes) {
+    const auto* bytes = static_cast<const uint8_t*>(data);
+    for (size_t i = 0; i < values && writer->GetError() == kStatusNoError; ++i)
+      writer->WriteExtended(bytes + i * kExtendedBytes);
+  } else if (values != 0) {
+    writer->WriteValues(data, parts.partSize, values);
+  }
+  if (status != nullptr) *status = writer->GetError();
+  return static_cast<int32_t>(writer->GetBytesWritten() - start);
+}
+
+int32_t TDBasicNumericImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  const size_t start = reader->Position();
+  const NumericParts parts = PartsOf(GetTypeCode());
+  const size_t values = parts.parts * static_cast<size_t>(std::max(count, 0));
+  if (parts.partSize == kExtendedBytes) {
+    auto* bytes = static_cast<uint8_t*>(data);
+    uint8_t scratch[kExtendedBytes];
+    for (size_t i = 0; i < values; ++i) reader->ReadExtended(bytes != nullptr ? bytes + i * kExtendedBytes : scratch);
+  } else if (data != nullptr) {
+    reader->ReadValues(data, parts.partSize, values);
+  } else {
+    reader->Skip(parts.partSize * values);
+  }
+  if (status != nullptr) *status = reader->GetError();
+  return static_cast<int32_t>(reader->Position() - start);
 }

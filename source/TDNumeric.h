@@ -73,6 +73,12 @@ class TDBasicNumericImp : public TDNumericImp {
   // The enumeration, the units, then the flag byte for versions that have it. The factory
   // reads them back.
   int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
+  // Each value in the stream's order; complex values real part first; extended values in the
+  // writer's 16-byte form.
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
+  int32_t IsFlatDataFixedSize() const override { return 1; }
   int32_t DataSizeCore(ITargetPlatformAlignment* platform) const override;
   int32_t GetAlignment(ITargetPlatformAlignment* platform) const override;
   int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;

@@ -2,6 +2,9 @@
 // between the two Boolean kinds.
 #include "source/TDSimpleTypes.h"
 
+#include "source/KoDataReader.h"
+#include "source/KoDataWriter.h"
+
 #include <cstring>
 
 #include "runtime/PXStrings.h"
@@ -167,3 +170,58 @@ void ITDVisitor::VisitBoolean(const TDRBoolean& type) { Visit(static_cast<const 
 void ITDVisitor::VisitBoolean(TDWBoolean& type) { Visit(static_cast<TDW&>(type)); }
 void ITDVisitor::VisitBooleanU16(const TDRBooleanU16& type) { Visit(static_cast<const TDR&>(type)); }
 void ITDVisitor::VisitBooleanU16(TDWBooleanU16& type) { Visit(static_cast<TDW&>(type)); }
+
+// --- flattened data --------------------------------------------------------------------------------
+
+namespace {
+
+constexpr uint32_t kOneByteBooleanVersion = 0x04502004;
+
+}  // namespace
+
+uint32_t TDBooleanImp::FlatDataSize(KoDataWriter* writer, const void*) const {
+  return writer != nullptr && writer->GetVersion() < kOneByteBooleanVersion ? 2 : 1;
+}
+
+int32_t TDBooleanImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  const size_t start = writer->GetBytesWritten();
+  const auto* bytes = static_cast<const uint8_t*>(data);
+  if (count > 0 && bytes == nullptr) writer->SetError(kStatusBadArgument);
+  if (writer->GetVersion() < kOneByteBooleanVersion) {
+    for (int32_t i = 0; i < count && writer->GetError() == kStatusNoError; ++i) writer->WriteBool(bytes[i] != 0);
+  } else if (count > 0) {
+    writer->WriteBytes(bytes, static_cast<size_t>(count));
+  }
+  if (status != nullptr) *status = writer->GetError();
+  return static_cast<int32_t>(writer->GetBytesWritten() - start);
+}
+
+int32_t TDBooleanImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  const size_t start = reader->Position();
+  auto* bytes = static_cast<uint8_t*>(data);
+  if (reader->GetVersion() < kOneByteBooleanVersion) {
+    if (count != 1) DebugReport(__FILE__, __LINE__, 3, "should not be doing multiple old bools");
+    for (int32_t i = 0; i < count; ++i) {
+      const uint8_t value = reader->ReadBool();
+      if (bytes != nullptr) bytes[i] = value;
+    }
+  } else if (count > 0) {
+    if (bytes != nullptr) {
+      reader->ReadBytes(bytes, static_cast<size_t>(count));
+    } else {
+      reader->Skip(static_cast<size_t>(count));
+    }
+  }
+  if (status != nullptr) *status = reader->GetError();
+  return static_cast<int32_t>(reader->Position() - start);
+}
+
+int32_t TDBooleanU16Imp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  DebugReport(__FILE__, __LINE__, 3, "Can't flatten old style boolean.");
+  return TDImp::WriteData(writer, data, count, status);
+}
+
+int32_t TDBooleanU16Imp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  DebugReport(__FILE__, __LINE__, 3, "Can't unflatten old style boolean.");
+  return TDImp::ReadData(reader, data, count, status);
+}

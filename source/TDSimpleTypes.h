@@ -30,6 +30,10 @@ class TDBooleanImp final : public TDImp {
   int32_t MutateBooleanTD(TDImpPtr* self, int32_t toOld) override;
   void Accept(ITDVisitor* visitor) override;
   int32_t IsBool() const override { return 1; }
+  // One byte as it is in memory; before 0x04502004 a 16-bit word, 0x8000 for true.
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
 };
 
 // The 16-bit Boolean of old data: two bytes per value.
@@ -45,4 +49,7 @@ class TDBooleanU16Imp final : public TDImp {
   int32_t MutateBooleanTD(TDImpPtr* self, int32_t toOld) override;
   void Accept(ITDVisitor* visitor) override;
   int32_t IsBoolU16() const override { return 1; }
+  // Has no flattened form: the bytes are copied as they are, after a diagnostic.
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
 };

@@ -16,6 +16,7 @@
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXStrings.h"
 #include "source/MoveBytes.h"
+#include "source/KoDataReader.h"
 #include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TDDataManager.h"
@@ -753,4 +754,159 @@ int32_t TDStringBaseImp::ConstructTD(TDDataReader* reader) {
   if (const int32_t status = reader->ReadI32(&bound); status != kStatusNoError) return status;
   SetBound(bound);
   return kStatusNoError;
+}
+
+// --- flattened data --------------------------------------------------------------------------------
+
+namespace {
+
+LStrHandle LoadHandle(const void* slot) { return Load<LStrHandle>(slot); }
+
+// One string value into *slot (null: skip it). 0, or the stream's status.
+int32_t ReadOneLStr(KoDataReader* reader, int32_t bound, LStrHandle* slot) {
+  int32_t length = 0;
+  if (reader->ReadI32(&length) != kStatusNoError) return reader->GetError();
+  // The bytes must be in the input before anything is allocated for them.
+  if (length < 0 || static_cast<size_t>(length) > reader->BytesLeft()) {
+    (VELLUM_DEBUG(2) << "ReadData: string length " << length << " is implausible with " << reader->BytesLeft()
+                     << " bytes left")
+        .Process();
+    reader->SetError(kStatusImplausibleData);
+    return reader->GetError();
+  }
+  if (slot == nullptr) return reader->Skip(static_cast<size_t>(length));
+  const int32_t target = vellum::bound::IsVariable(bound) ? length : vellum::bound::Length(bound);
+  if (target == 0 && *slot == nullptr) return reader->Skip(static_cast<size_t>(length));
+  const size_t need = sizeof(int32_t) + static_cast<size_t>(target);
+  UHandle h = reinterpret_cast<UHandle>(*slot);
+  if (!vellum::bound::IsVariable(bound) && h != nullptr && DSGetHandleSize(h) != need)
+    DebugReport(__FILE__, __LINE__, 3, "fixed/bounded str was preallocated to wrong size?");
+  if (h == nullptr || DSGetHandleSize(h) < need) {
+    if (!reader->MayAllocate(need)) return reader->GetError();
+  }
+  if (h == nullptr || DSGetHandleSize(h) != need) {
+    const int32_t status = DSSetHandleSizeOrNewHandle(&h, need);
+    if (status != kStatusNoError) {
+      reader->SetError(status == kStatusOutOfMemory ? kStatusReadAllocationFailed : status);
+      return reader->GetError();
+    }
+    *slot = reinterpret_cast<LStrHandle>(h);
+  }
+  uint8_t* bytes = *h + sizeof(int32_t);
+  const int32_t taken = std::min(target, length);
+  reader->ReadBytes(bytes, static_cast<size_t>(taken));
+  if (target > length) std::memset(bytes + length, 0, static_cast<size_t>(target - length));
+  if (length > target) reader->Skip(static_cast<size_t>(length - target));
+  const int32_t stored = target < length || vellum::bound::IsFixed(bound) ? target : length;
+  std::memcpy(*h, &stored, sizeof stored);
+  if (reader->GetError() != kStatusNoError) {
+    const int32_t empty = 0;
+    std::memcpy(*h, &empty, sizeof empty);
+  }
+  return reader->GetError();
+}
+
+}  // namespace
+
+uint32_t TDStringBaseImp::FlatDataSize(KoDataWriter*, const void* data) const {
+  if (data == nullptr) return 4 + static_cast<uint32_t>(vellum::bound::IsFixed(bound_) ? vellum::bound::Length(bound_) : 0);
+  const LStrHandle h = LoadHandle(data);
+  return 4 + static_cast<uint32_t>(h != nullptr ? std::max((*h)->cnt, 0) : 0);
+}
+
+int32_t TDStringBaseImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  const size_t start = writer->GetBytesWritten();
+  if (count > 0 && data == nullptr) writer->SetError(kStatusBadArgument);
+  const auto* slots = static_cast<const uint8_t*>(data);
+  for (int32_t i = 0; i < count && writer->GetError() == kStatusNoError; ++i)
+    writer->WriteLStr(LoadHandle(slots + static_cast<size_t>(i) * sizeof(LStrHandle)));
+  if (status != nullptr) *status = writer->GetError();
+  return static_cast<int32_t>(writer->GetBytesWritten() - start);
+}
+
+int32_t TDStringBaseImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  const size_t start = reader->Position();
+  auto* slots = static_cast<uint8_t*>(data);
+  for (int32_t i = 0; i < count && reader->GetError() == kStatusNoError; ++i) {
+    if (slots == nullptr) {
+      ReadOneLStr(reader, bound_, nullptr);
+      continue;
+    }
+    uint8_t* slot = slots + static_cast<size_t>(i) * sizeof(LStrHandle);
+    LStrHandle h = LoadHandle(slot);
+    ReadOneLStr(reader, bound_, &h);
+    Store(slot, h);
+  }
+  if (status != nullptr) *status = reader->GetError();
+  return static_cast<int32_t>(reader->Position() - start);
+}
+
+uint32_t TDSubStringImp::FlatDataSize(KoDataWriter*, const void* data) const {
+  if (data == nullptr) return 4;
+  const SubStringRec rec = Load<SubStringRec>(data);
+  return 4 + static_cast<uint32_t>(std::max(rec.length, 0));
+}
+
+int32_t TDSubStringImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  const size_t start = writer->GetBytesWritten();
+  if (count > 0 && data == nullptr) writer->SetError(kStatusBadArgument);
+  const auto* records = static_cast<const uint8_t*>(data);
+  for (int32_t i = 0; i < count && writer->GetError() == kStatusNoError; ++i) {
+    const SubStringRec rec = Load<SubStringRec>(records + static_cast<size_t>(i) * sizeof(SubStringRec));
+    if (!ReadableRecord(rec)) {
+      writer->SetError(kStatusBadArgument);
+      break;
+    }
+    if (rec.stride != 1)
+      (VELLUM_DEBUG(2) << "KoDataWriter::WriteData : substring stride == " << static_cast<int64_t>(rec.stride)).Process();
+    writer->WriteI32(rec.length);
+    for (int32_t k = 0; k < rec.length && writer->GetError() == kStatusNoError; ++k)
+      writer->WriteU8(rec.dataPtr[static_cast<intptr_t>(k) * rec.stride]);
+  }
+  if (status != nullptr) *status = writer->GetError();
+  return static_cast<int32_t>(writer->GetBytesWritten() - start);
+}
+
+int32_t TDSubStringImp::ReadData(KoDataReader* reader, void*, int32_t, int32_t* status) const {
+  DebugReport(__FILE__, __LINE__, 2, "ReadData does not handle subStrings!");
+  if (status != nullptr) *status = reader->GetError();
+  return 0;
+}
+
+uint32_t TDPathImp::FlatDataSize(KoDataWriter*, const void* data) const {
+  if (data == nullptr) return 12;
+  PreflightOutputBuf counter;
+  BinDataWriter writer(&counter, nullptr);
+  writer.WritePath(Load<Path>(data));
+  return static_cast<uint32_t>(counter.GetBytesWritten());
+}
+
+int32_t TDPathImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+  const size_t start = writer->GetBytesWritten();
+  if (count > 0 && data == nullptr) writer->SetError(kStatusBadArgument);
+  const auto* slots = static_cast<const uint8_t*>(data);
+  for (int32_t i = 0; i < count && writer->GetError() == kStatusNoError; ++i)
+    writer->WritePath(Load<Path>(slots + static_cast<size_t>(i) * sizeof(Path)));
+  if (status != nullptr) *status = writer->GetError();
+  return static_cast<int32_t>(writer->GetBytesWritten() - start);
+}
+
+// A path read replaces the one in place, which is disposed of; a failed read leaves no path.
+int32_t TDPathImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  const size_t start = reader->Position();
+  auto* slots = static_cast<uint8_t*>(data);
+  for (int32_t i = 0; i < count && reader->GetError() == kStatusNoError; ++i) {
+    Path read = nullptr;
+    reader->ReadPath(&read);
+    if (slots == nullptr) {
+      FDestroyPath(&read);
+      continue;
+    }
+    uint8_t* slot = slots + static_cast<size_t>(i) * sizeof(Path);
+    Path old = Load<Path>(slot);
+    FDestroyPath(&old);
+    Store(slot, read);
+  }
+  if (status != nullptr) *status = reader->GetError();
+  return static_cast<int32_t>(reader->Position() - start);
 }

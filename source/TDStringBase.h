@@ -41,6 +41,12 @@ class TDStringBaseImp : public TDImp {
   // The bound word.
   int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
   int32_t ConstructTD(TDDataReader* reader) override;
+  // Each value as a 32-bit length and the bytes (a null handle is length 0). Reading sizes the
+  // handle for the bound word (the length read for a variable string), truncates or zero-fills
+  // to it, and refuses a length that is negative or beyond the input (116) before allocating.
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsFlatDataFixedSize() const override { return vellum::bound::IsFixed(bound_) ? 1 : 0; }
   int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;
   // Into the same code, or between String and Tag, following the destination's bound word.
@@ -108,6 +114,10 @@ class TDSubStringImp final : public TDStringBaseImp {
   int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
   int32_t ResetToDefaultData(void* data) const override;
   int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const override;
+  // Written as the string it views; never read ("ReadData does not handle subStrings!").
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsString() const override { return 1; }
   int32_t IsSubStringOnly() const override { return 1; }
   int32_t IsSubType() const override { return 1; }
@@ -134,6 +144,10 @@ class TDPathImp final : public TDStringBaseImp {
   int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;
   int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
   int32_t ResetToDefaultData(void* data) const override;
+  // The runtime's flattened path; a null path reads and writes as not-a-path.
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsPath() const override { return 1; }
 
  protected:

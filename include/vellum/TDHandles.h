@@ -20,6 +20,8 @@ class TDUnitsImp;
 class TDEnumImp;
 class TDOMIdImp;
 class ITDVisitor;
+class KoDataWriter;
+class KoDataReader;
 class HandleAllocationInterface;
 
 // Owning pointer to a counted object. Copying takes a reference; `Free` drops it and destroys the
@@ -191,6 +193,14 @@ class TD {
   // The kind's comparison of class data; 42 for a null handle. Kinds without one answer 0 and
   // leave *dataType as it is.
   int32_t CompareClassData(int32_t how, const void* data, const TDR& other, TDR* dataType) const;
+
+  // The flattened form of `count` values at `data` (consecutive, DataSize apart): the bytes
+  // written or read, with the stream's status in *status (42 for a null handle). Reading fills
+  // default data of the type (null `data` skips the values).
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const;
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const;
+  // The bytes WriteData would write for one value; null `data` gives the size without data.
+  uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const;
 
  protected:
   TDImpPtr imp_;

@@ -1,0 +1,270 @@
+// Flattened data: the stored bytes of values of every kind, reading them back, and the refusals
+// that keep short or hostile input from costing memory it does not pay for.
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <cstdio>
+#include <cstring>
+#include <limits>
+#include <string>
+#include <vector>
+
+#include "TestSupport.h"
+#include "TypeSystemFixture.h"
+#include "runtime/HandleAllocation.h"
+#include "runtime/PXApp.h"
+#include "runtime/PXNumbers.h"
+#include "runtime/PXStrings.h"
+#include "source/KoDataReader.h"
+#include "source/KoDataWriter.h"
+#include "vellum.h"
+
+namespace {
+
+class KoDataFlattenTest : public TypeSystemTest {};
+
+std::string Hex(const uint8_t* data, size_t size) {
+  std::string text;
+  for (size_t i = 0; i < size; ++i) {
+    char pair[4];
+    std::snprintf(pair, sizeof pair, i == 0 ? "%02X" : " %02X", data[i]);
+    text += pair;
+  }
+  return text;
+}
+
+std::vector<uint8_t> FromHex(const std::string& text) {
+  std::vector<uint8_t> bytes;
+  for (size_t i = 0; i < text.size();) {
+    if (text[i] == ' ') {
+      ++i;
+      continue;
+    }
+    bytes.push_back(static_cast<uint8_t>(std::stoul(text.substr(i, 2), nullptr, 16)));
+    i += 2;
+  }
+  return bytes;
+}
+
+// One datum of a type in properly aligned storage, inflated to the default and disposed of after.
+class Datum {
+ public:
+  explicit Datum(const TDR& type) : type_(type), storage_((static_cast<size_t>(type.DataSize()) + 15) / 8 + 1, 0) {
+    EXPECT_EQ(type_.InflateDefData(Data(), 0, 1, 0), kStatusNoError);
+  }
+  ~Datum() {
+    auto* begin = static_cast<uint8_t*>(Data());
+    type_.DeflateData(begin, begin + storage_.size() * sizeof(uint64_t), 1, NormalHandleAllocator());
+  }
+  Datum(const Datum&) = delete;
+  Datum& operator=(const Datum&) = delete;
+  void* Data() { return storage_.data(); }
+  template <class T>
+  T Get(size_t offset = 0) {
+    T value;
+    std::memcpy(&value, reinterpret_cast<uint8_t*>(Data()) + offset, sizeof value);
+    return value;
+  }
+  template <class T>
+  void Set(T value, size_t offset = 0) {
+    std::memcpy(reinterpret_cast<uint8_t*>(Data()) + offset, &value, sizeof value);
+  }
+
+ private:
+  TDR type_;
+  std::vector<uint64_t> storage_;
+};
+
+std::string Flatten(const TDR& type, const void* data, uint32_t version = PXApp::Instance().GetVersion()) {
+  OutputBuf out;
+  KoDataWriter writer(&out, version, nullptr, 0);
+  const int32_t status = writer.WriteData(type, data, 1);
+  if (status != kStatusNoError) return "status " + std::to_string(status);
+  EXPECT_EQ(type.FlatDataSize(&writer, data), out.GetBytesWritten());
+  return Hex(out.Data(), out.GetBytesWritten());
+}
+
+// Reads `hex` into `datum`; the status, and every byte must be consumed on success.
+int32_t Unflatten(const TDR& type, const std::string& hex, void* data,
+                  uint32_t version = PXApp::Instance().GetVersion()) {
+  const std::vector<uint8_t> bytes = FromHex(hex);
+  InputBuf in(bytes.data(), bytes.size());
+  KoDataReader reader(&in, version, nullptr, nullptr, 0);
+  const int32_t status = reader.ReadData(type, data, 1);
+  if (status == kStatusNoError) {
+    EXPECT_EQ(reader.BytesLeft(), 0u) << hex;
+  }
+  return status;
+}
+
+std::string Text(LStrHandle h) {
+  return h == nullptr ? std::string("<null>") : std::string(reinterpret_cast<const char*>((*h)->str), static_cast<size_t>((*h)->cnt));
+}
+
+// --- the stored bytes --------------------------------------------------------------------------------
+
+TEST_F(KoDataFlattenTest, GoldenValues) {
+  const int32_t one = 1;
+  EXPECT_EQ(Flatten(GetiL(), &one), "00 00 00 01");
+  const double unit = 1.0;
+  EXPECT_EQ(Flatten(GetfD(), &unit), "3F F0 00 00 00 00 00 00");
+  const uint8_t yes = 1;
+  EXPECT_EQ(Flatten(GetBoolTD(), &yes), "01");
+  EXPECT_EQ(Flatten(GetBoolTD(), &yes, 0x04502003), "80 00");
+
+  Datum empty(GetStringTD());
+  EXPECT_EQ(Flatten(GetStringTD(), empty.Data()), "00 00 00 00");
+  Datum abc(GetStringTD());
+  LStrHandle text = nullptr;
+  ASSERT_EQ(StringUtils::ToLStr("abc", &text), kStatusNoError);
+  abc.Set(text);
+  EXPECT_EQ(Flatten(GetStringTD(), abc.Data()), "00 00 00 03 61 62 63");
+
+  const TDR shorts = TDRArray(1, GetiW());
+  Datum none(shorts);
+  EXPECT_EQ(Flatten(shorts, none.Data()), "00 00 00 00");
+  Datum two(shorts);
+  ASSERT_EQ(Unflatten(shorts, "00 00 00 02 00 01 00 02", two.Data()), kStatusNoError);
+  EXPECT_EQ(Flatten(shorts, two.Data()), "00 00 00 02 00 01 00 02");
+
+  TDWCluster pair;
+  pair << GetiB() << GetiL();
+  const TDR cluster = pair.CheckIn();
+  Datum packed(cluster);
+  packed.Set<int8_t>(-2);
+  packed.Set<int32_t>(0x01020304, static_cast<size_t>(TDRCluster(cluster.GetImpPtr(), 1).GetEltOffset(1)));
+  EXPECT_EQ(Flatten(cluster, packed.Data()), "FE 01 02 03 04");
+}
+
+TEST_F(KoDataFlattenTest, EveryNumericKindRoundTrips) {
+  for (int32_t code = 1; code <= 14; ++code) {
+    SCOPED_TRACE(code);
+    const TDR type = MakeDefaultTDRForTypeCode(code);
+    std::vector<uint8_t> value(static_cast<size_t>(type.DataSize()));
+    for (size_t i = 0; i < value.size(); ++i) value[i] = static_cast<uint8_t>(0x11 * (i + 1));
+    const std::string flat = Flatten(type, value.data());
+    std::vector<uint8_t> back(value.size(), 0);
+    ASSERT_EQ(Unflatten(type, flat, back.data()), kStatusNoError);
+    EXPECT_EQ(back, value);
+  }
+  // Big-endian integers, real part first.
+  const float complex[2] = {1.0f, -2.0f};
+  EXPECT_EQ(Flatten(GetcS(), complex), "3F 80 00 00 C0 00 00 00");
+}
+
+TEST_F(KoDataFlattenTest, ExtendedValuesTakeSixteenBytesAndKeepEveryBit) {
+  uint8_t ten[10];
+  LongDoubleToExtended(1.0L, ten);
+  // 1.0 as binary128: sign and exponent 3FFF, every fraction bit zero.
+  EXPECT_EQ(Flatten(GetfX(), ten), "3F FF 00 00 00 00 00 00 00 00 00 00 00 00 00 00");
+  LongDoubleToExtended(-0.1L, ten);
+  EXPECT_EQ(Flatten(GetfX(), ten), "BF FB 99 99 99 99 99 99 99 9A 00 00 00 00 00 00");
+  // An unnormal (integer bit clear with a nonzero exponent) keeps its integer bit apart.
+  const uint8_t unnormal[10] = {0x01, 0, 0, 0, 0, 0, 0, 0x40, 0xFF, 0x3F};
+  const std::string flat = Flatten(GetfX(), unnormal);
+  EXPECT_EQ(flat, "3F FF 80 00 00 00 00 00 00 02 00 00 00 00 00 01");
+  uint8_t back[10] = {};
+  ASSERT_EQ(Unflatten(GetfX(), flat, back), kStatusNoError);
+  EXPECT_EQ(std::memcmp(back, unnormal, 10), 0);
+  // Random bit patterns, all 80 bits.
+  uint64_t state = 0x9E3779B97F4A7C15ull;
+  for (int i = 0; i < 2000; ++i) {
+    uint8_t value[10];
+    for (uint8_t& byte : value) {
+      state = state * 6364136223846793005ull + 1442695040888963407ull;
+      byte = static_cast<uint8_t>(state >> 56);
+    }
+    uint8_t read[10] = {};
+    ASSERT_EQ(Unflatten(GetfX(), Flatten(GetfX(), value), read), kStatusNoError);
+    ASSERT_EQ(std::memcmp(read, value, 10), 0) << i;
+  }
+}
+
+TEST_F(KoDataFlattenTest, StringsFollowTheirBound) {
+  const TDR bounded = TDRString(nullptr, 2);
+  Datum two(bounded);
+  ASSERT_EQ(Unflatten(bounded, "00 00 00 03 61 62 63", two.Data()), kStatusNoError);
+  EXPECT_EQ(Text(two.Get<LStrHandle>()), "ab");
+  const TDR fixed = TDRString(nullptr, vellum::bound::Fixed(5));
+  Datum five(fixed);
+  ASSERT_EQ(Unflatten(fixed, "00 00 00 03 61 62 63", five.Data()), kStatusNoError);
+  EXPECT_EQ(Text(five.Get<LStrHandle>()), std::string("abc\0\0", 5));
+  // A length far beyond the input is refused before anything is allocated.
+  Datum big(GetStringTD());
+  LiveBlockCheck blocks;
+  EXPECT_EQ(Unflatten(GetStringTD(), "00 30 00 00 61 62", big.Data()), kStatusImplausibleData);
+  EXPECT_EQ(big.Get<LStrHandle>(), nullptr);
+  EXPECT_EQ(Unflatten(GetStringTD(), "FF FF FF FF", big.Data()), kStatusImplausibleData);
+}
+
+TEST_F(KoDataFlattenTest, ArraysAreRefusedWhenTheirElementsCannotBeInTheInput) {
+  const TDR doubles = TDRArray(1, GetfD());
+  const TDR pointers = TDRArray(1, TDRPtr());
+  const TDR square = TDRArray(2, GetiB());
+  Datum value(doubles);
+  LiveBlockCheck blocks;
+  DebugCapture capture;
+  EXPECT_EQ(Unflatten(doubles, "00 01 FF FF 00 00", value.Data()), kStatusImplausibleData);
+  EXPECT_EQ(value.Get<UHandle>(), nullptr);
+  // Elements that flatten to nothing are bounded by what a read may allocate.
+  Datum many(pointers);
+  EXPECT_EQ(Unflatten(pointers, "01 00 00 00", many.Data()), kStatusImplausibleData);
+  ASSERT_EQ(Unflatten(pointers, "00 00 10 00", many.Data()), kStatusNoError);
+  // 64-bit products that overflow are refused.
+  Datum grid(square);
+  EXPECT_EQ(Unflatten(square, "7F FF FF FF 7F FF FF FF", grid.Data()), kStatusImplausibleData);
+}
+
+TEST_F(KoDataFlattenTest, BoundedAndFixedArraysStayInTheirBlocks) {
+  TDWArray bounded(0, GetiW());
+  bounded.AddDim(2, 0);
+  const TDR type = bounded.CheckIn();
+  Datum value(type);
+  ASSERT_EQ(Unflatten(type, "00 00 00 03 00 01 00 02 00 03", value.Data()), kStatusNoError);
+  EXPECT_EQ(Flatten(type, value.Data()), "00 00 00 02 00 01 00 02");
+  TDWArray fixed(0, GetiW());
+  fixed.AddDim(vellum::bound::Fixed(3), 0);
+  const TDR fixedType = fixed.CheckIn();
+  Datum three(fixedType);
+  DebugCapture capture;
+  ASSERT_EQ(Unflatten(fixedType, "00 00 00 02 00 07 00 08", three.Data()), kStatusNoError);
+  EXPECT_TRUE(capture.Contains("fixed size array prealloc'd wrong?"));
+  EXPECT_EQ(Flatten(fixedType, three.Data()), "00 00 00 03 00 07 00 08 00 00");
+}
+
+TEST_F(KoDataFlattenTest, OldBooleansArePackedSixteenToAWord) {
+  const TDR flags = TDRArray(1, GetBoolTD());
+  Datum value(flags);
+  ASSERT_EQ(Unflatten(flags, "00 00 00 03 01 00 01", value.Data()), kStatusNoError);
+  EXPECT_EQ(Flatten(flags, value.Data(), 0x04502003), "00 00 00 03 A0 00");
+  Datum back(flags);
+  ASSERT_EQ(Unflatten(flags, "00 00 00 03 A0 00", back.Data(), 0x04502003), kStatusNoError);
+  EXPECT_EQ(Flatten(flags, back.Data()), "00 00 00 03 01 00 01");
+}
+
+TEST_F(KoDataFlattenTest, PointersNeverTravel) {
+  void* pointer = reinterpret_cast<void*>(0x1234);
+  EXPECT_EQ(Flatten(TDRPtr(), &pointer), "");
+  EXPECT_EQ(Flatten(TDRPtr(), &pointer, 0x08602025), "00 00 00 00");
+  ASSERT_EQ(Unflatten(TDRPtr(), "00 00 00 00", &pointer, 0x08602025), kStatusNoError);
+  EXPECT_EQ(pointer, nullptr);
+}
+
+TEST_F(KoDataFlattenTest, EveryPrefixOfAGoldenValueFailsCleanly) {
+  TDWCluster record;
+  record << GetiL() << GetStringTD() << TDRArray(1, GetStringTD()) << GetPathTD();
+  const TDR type = record.CheckIn();
+  Datum value(type);
+  const std::string full = "00 00 00 07 00 00 00 02 68 69 00 00 00 02 00 00 00 01 61 00 00 00 00 50 54 48 30 00 00 00 04 00 00 00 00";
+  ASSERT_EQ(Unflatten(type, full, value.Data()), kStatusNoError);
+  const std::vector<uint8_t> bytes = FromHex(full);
+  for (size_t n = 0; n < bytes.size(); ++n) {
+    SCOPED_TRACE(n);
+    Datum partial(type);
+    InputBuf in(bytes.data(), n);
+    KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
+    EXPECT_NE(reader.ReadData(type, partial.Data(), 1), kStatusNoError);
+  }
+}
+
+}  // namespace
