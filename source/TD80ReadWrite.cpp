@@ -478,8 +478,12 @@ int32_t UnFlattenListOfTypes(const PersistTDData* persist, const uint8_t* data, 
   InputBuf in(data, size);
   TDDataReader reader(persist, &in, endianizer != nullptr ? endianizer : &kBigEndian);
   const PersistTDData& context = *reader.GetPersistTDData();
-  if (context.PersistingWithConsolidatedTypes()) return ReadConsolidated(reader, context, out, outExtra, single);
-  return ReadOrdinary(reader, out, outExtra);
+  const int32_t status = context.PersistingWithConsolidatedTypes()
+                             ? ReadConsolidated(reader, context, out, outExtra, single)
+                             : ReadOrdinary(reader, out, outExtra);
+  if (reader.GetError() == kStatusCorruptData)
+    DebugReport(__FILE__, __LINE__, 2, "UnFlattenListOfTypes : The type string is damaged or ends early.");
+  return status;
 }
 
 int32_t UnFlattenListOfTypes(const PersistTDData* persist, UHandle handle, TMTypeList* out, uint32_t** outExtra,
