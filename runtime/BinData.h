@@ -81,6 +81,8 @@ class OutputBuf {
   // Copies the bytes into *out: a null or non-live *out gets a new handle, a live one is resized.
   int32_t CopyToHandle(UHandle* out) const;
   void Clear();
+  // Empties the buffer but keeps its memory for the next use.
+  void Rewind() { bytes_.clear(); }
 
  private:
   std::vector<uint8_t, PXAllocator<uint8_t>> bytes_;

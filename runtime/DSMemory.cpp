@@ -181,6 +181,8 @@ int32_t DSSetHSzOrNewHClr(UHandle* h, size_t size) {
   return ResizeImpl(*h, size, true, true);
 }
 
+size_t DSGetLiveHandleSize(UHandle h) { return h ? reinterpret_cast<const HandleRec*>(h)->size : 0; }
+
 size_t DSGetHandleSize(UHandle h) {
   const HandleRec* rec = LiveHandle(h);
   return rec ? rec->size : 0;

@@ -32,6 +32,9 @@ int32_t DSSetHandleSizeOrNewHandle(UHandle* h, size_t size);
 int32_t DSSetHSzOrNewHClr(UHandle* h, size_t size);
 // 0 for a null or non-live handle.
 size_t DSGetHandleSize(UHandle h);
+// The same for a handle the caller holds in data it owns, which it knows to be live (or null):
+// no registry lookup, so it must never see a handle that came from outside.
+size_t DSGetLiveHandleSize(UHandle h);
 // Makes *dst a copy of src: a live *dst is resized and reused, anything else is replaced by a
 // new handle (a non-live *dst is not freed). A null src disposes a live *dst and sets it null.
 // On failure *dst keeps its old value and status 2 is returned.

@@ -779,12 +779,12 @@ int32_t ReadOneLStr(KoDataReader* reader, int32_t bound, LStrHandle* slot) {
   if (target == 0 && *slot == nullptr) return reader->Skip(static_cast<size_t>(length));
   const size_t need = sizeof(int32_t) + static_cast<size_t>(target);
   UHandle h = reinterpret_cast<UHandle>(*slot);
-  if (!vellum::bound::IsVariable(bound) && h != nullptr && DSGetHandleSize(h) != need)
+  // The destination is the caller's datum: its handles are live.
+  const size_t have = DSGetLiveHandleSize(h);
+  if (!vellum::bound::IsVariable(bound) && h != nullptr && have != need)
     DebugReport(__FILE__, __LINE__, 3, "fixed/bounded str was preallocated to wrong size?");
-  if (h == nullptr || DSGetHandleSize(h) < need) {
-    if (!reader->MayAllocate(need)) return reader->GetError();
-  }
-  if (h == nullptr || DSGetHandleSize(h) != need) {
+  if ((h == nullptr || have < need) && !reader->MayAllocate(need)) return reader->GetError();
+  if (h == nullptr || have != need) {
     const int32_t status = DSSetHandleSizeOrNewHandle(&h, need);
     if (status != kStatusNoError) {
       reader->SetError(status == kStatusOutOfMemory ? kStatusReadAllocationFailed : status);
