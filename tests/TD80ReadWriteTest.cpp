@@ -264,6 +264,23 @@ TEST_F(TD80ReadWriteTest, DamagedStringsFailWithAMessage) {
   EXPECT_EQ(UnFlattenListOfTypes(nullptr, manyEntries.data(), 6, nullptr, nullptr, 0, nullptr), kStatusBadArgument);
 }
 
+TEST_F(TD80ReadWriteTest, ClustersTooWideToLoadAreNotSaved) {
+  TDWCluster wide;
+  ASSERT_EQ(wide.ReserveElementCount(65536), kStatusNoError);
+  for (int32_t i = 0; i < 65535; ++i) ASSERT_EQ(wide.AppendEltTD(GetiB()), kStatusNoError);
+  const TDR widest = wide.CheckIn();
+  EXPECT_EQ(RoundTrip(widest), widest);
+
+  ASSERT_EQ(wide.AppendEltTD(GetiB()), kStatusNoError);
+  DebugCapture capture;
+  UHandle h = nullptr;
+  EXPECT_EQ(FlattenOneType(nullptr, wide.CheckIn(), &h, nullptr), kStatusBadArgument);
+  EXPECT_EQ(h, nullptr);
+  EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"Too many elements in a container to save: 65536",
+                                                       "Saving type descriptors encountered an error!",
+                                                       "KoDataWriter finished with 1 error"}));
+}
+
 TEST_F(TD80ReadWriteTest, NullOutputHandleIsRefused) {
   DebugCapture capture;
   TMTypeList list;
