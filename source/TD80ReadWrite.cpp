@@ -215,7 +215,8 @@ const TDR& TDDataReader::ConstructEltTD() {
 
   if (const char* refusal = ExceedsLimits(*type)) {
     DebugReport(__FILE__, __LINE__, 2, refusal);
-    SetError(kStatusCorruptData);
+    // Sound bytes that describe too much: not damage, so no second message says so.
+    SetError(kStatusImplausibleData);
     return GNullTD();
   }
   TDImpPtr interned = type->CheckIn();

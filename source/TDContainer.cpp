@@ -593,6 +593,12 @@ int32_t TDSingleContainerImp::ConstructTD(TDDataReader* reader) {
 }
 
 int32_t TDMultiContainerImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
+  // A reader refuses such a count, so writing it would save a string that never loads.
+  if (GetNumElts() > kMaxClusterElements) {
+    (VELLUM_DEBUG(2) << "Too many elements in a container to save: " << GetNumElts()).Process();
+    writer->SetError(kStatusBadArgument);
+    return kStatusBadArgument;
+  }
   writer->WriteVariableSizeField(GetNumElts());
   for (const TDImpPtr& element : elements_)
     if (const int32_t status = WriteEltIndex(writer, element); status != kStatusNoError) return status;

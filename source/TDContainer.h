@@ -100,7 +100,8 @@ class TDMultiContainerImp : public TDContainerImp {
   int32_t MemberCheckIn(TDImpPtr& target) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t IsMultiContainer() const override { return 1; }
-  // The element count, then each element's save-table index.
+  // The element count, then each element's save-table index. More than 65535 elements are
+  // refused (1), as a reader would refuse them.
   int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
   // A count of more than 65535 elements is outside the format and refused (74); a missing
   // element is 42.

@@ -20,6 +20,24 @@ constexpr TagType kTagTypeConvertibleB = 2;
 // The kind whose data a Tallis refnum can give.
 constexpr TagType kTagTypeTallis = 15;
 constexpr size_t kMaxClassLength = 255;
+// The valid kinds.
+constexpr TagType kFirstTagType = 1;
+constexpr TagType kLastTagType = 23;
+
+bool IsValidTagType(int32_t kind) { return kind >= kFirstTagType && kind <= kLastTagType; }
+
+// A stored kind outside the valid ones is reported; when it reads as a valid kind with its two
+// bytes swapped, it was written in the wrong byte order and the swapped kind is taken.
+uint16_t RepairedTagType(uint16_t kind) {
+  if (IsValidTagType(kind)) return kind;
+  (VELLUM_DEBUG(2) << "invalid tag type:" << static_cast<int32_t>(kind)).Process();
+  const auto swapped = static_cast<uint16_t>((kind >> 8) | (kind << 8));
+  if (!IsValidTagType(swapped)) return kind;
+  (VELLUM_DEBUG(2) << "replacing invalid tag type:" << static_cast<int32_t>(kind) << " with:"
+                    << static_cast<int32_t>(swapped))
+      .Process();
+  return swapped;
+}
 
 std::atomic<TagComparisonFunc> gComparisonFunc{nullptr};
 
@@ -59,6 +77,7 @@ class TagFactory final : public TDTypeFactory {
         *status = reader->GetError();
         return TDImpPtr();
       }
+      kind = RepairedTagType(kind);
     }
     TDImpPtr type;
     if (kind == kTagTypeUserDefined) {

@@ -2,16 +2,25 @@
 // version rules, and the refusals that keep damaged or hostile strings from harming the host.
 #include <gtest/gtest.h>
 
+#include <pthread.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <chrono>
 #include <cstdio>
 #include <cstring>
+#include <functional>
 #include <string>
 #include <vector>
 
 #include "TestSupport.h"
 #include "TypeSystemFixture.h"
+#include "runtime/HandleAllocation.h"
 #include "runtime/PXApp.h"
 #include "runtime/PXResources.h"
 #include "source/KoDataReader.h"
+#include "runtime/PXStrings.h"
+#include "source/CoreTDTable.h"
 #include "vellum.h"
 #include "vellum/TypeStrings.h"
 
@@ -265,6 +274,23 @@ TEST_F(TD80ReadWriteTest, DamagedStringsFailWithAMessage) {
   EXPECT_EQ(UnFlattenListOfTypes(nullptr, manyEntries.data(), 6, nullptr, nullptr, 0, nullptr), kStatusBadArgument);
 }
 
+TEST_F(TD80ReadWriteTest, ClustersTooWideToLoadAreNotSaved) {
+  TDWCluster wide;
+  ASSERT_EQ(wide.ReserveElementCount(65536), kStatusNoError);
+  for (int32_t i = 0; i < 65535; ++i) ASSERT_EQ(wide.AppendEltTD(GetiB()), kStatusNoError);
+  const TDR widest = wide.CheckIn();
+  EXPECT_EQ(RoundTrip(widest), widest);
+
+  ASSERT_EQ(wide.AppendEltTD(GetiB()), kStatusNoError);
+  DebugCapture capture;
+  UHandle h = nullptr;
+  EXPECT_EQ(FlattenOneType(nullptr, wide.CheckIn(), &h, nullptr), kStatusBadArgument);
+  EXPECT_EQ(h, nullptr);
+  EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"Too many elements in a container to save: 65536",
+                                                       "Saving type descriptors encountered an error!",
+                                                       "KoDataWriter finished with 1 error"}));
+}
+
 TEST_F(TD80ReadWriteTest, NullOutputHandleIsRefused) {
   DebugCapture capture;
   TMTypeList list;
@@ -391,6 +417,360 @@ TEST_F(TD80ReadWriteTest, AllocationFailuresLeaveNothingBehind) {
     return status;
   });
   DSDisposeHandle(h);
+}
+
+// --- limits ------------------------------------------------------------------------------------------
+
+// Type strings written byte by byte: short records (2-byte size fields and indices), then a list
+// of one entry, the last record.
+class TypeStringBytes {
+ public:
+  // A record of `code` with `payload` and, when `name` is not empty, a name part.
+  void Record(uint16_t code, const std::vector<uint8_t>& payload, const std::string& name = "") {
+    std::vector<uint8_t> body;
+    PutU16(body, name.empty() ? code : static_cast<uint16_t>(code | 0x4000));
+    body.insert(body.end(), payload.begin(), payload.end());
+    if (!name.empty()) {
+      body.push_back(static_cast<uint8_t>(name.size()));
+      body.insert(body.end(), name.begin(), name.end());
+      if ((name.size() + 1) % 2 != 0) body.push_back(0);
+    }
+    PutU16(records_, static_cast<uint16_t>(body.size() + 2));
+    records_.insert(records_.end(), body.begin(), body.end());
+    ++count_;
+  }
+  uint16_t Count() const { return count_; }
+
+  std::vector<uint8_t> OneEntryList() const {
+    std::vector<uint8_t> bytes = {0, 0, static_cast<uint8_t>(count_ >> 8), static_cast<uint8_t>(count_)};
+    bytes.insert(bytes.end(), records_.begin(), records_.end());
+    PutU16(bytes, 1);
+    PutU16(bytes, static_cast<uint16_t>(count_ - 1));
+    return bytes;
+  }
+
+  static std::vector<uint8_t> U16s(std::initializer_list<uint16_t> values) {
+    std::vector<uint8_t> bytes;
+    for (const uint16_t v : values) PutU16(bytes, v);
+    return bytes;
+  }
+  static std::vector<uint8_t> U32(uint32_t v) {
+    return {static_cast<uint8_t>(v >> 24), static_cast<uint8_t>(v >> 16), static_cast<uint8_t>(v >> 8),
+            static_cast<uint8_t>(v)};
+  }
+
+ private:
+  static void PutU16(std::vector<uint8_t>& bytes, uint16_t v) {
+    bytes.push_back(static_cast<uint8_t>(v >> 8));
+    bytes.push_back(static_cast<uint8_t>(v));
+  }
+  std::vector<uint8_t> records_;
+  uint16_t count_ = 0;
+};
+
+constexpr uint16_t kCodeInt32 = 0x03;
+constexpr uint16_t kCodeString = 0x30;
+constexpr uint16_t kCodeCluster = 0x50;
+constexpr uint16_t kCodeBlock = 0x60;
+
+// `levels` records: a variable String named `innermost`, then clusters each holding the record
+// before it, the last one named `outermost` (when not empty). Record i is i + 1 levels deep.
+std::vector<uint8_t> ClusterChain(int32_t levels, const std::string& innermost, const std::string& outermost) {
+  TypeStringBytes bytes;
+  bytes.Record(kCodeString, TypeStringBytes::U32(0xFFFFFFFF), innermost);
+  for (int32_t i = 1; i < levels; ++i) {
+    bytes.Record(kCodeCluster, TypeStringBytes::U16s({1, static_cast<uint16_t>(i - 1)}),
+                 i == levels - 1 ? outermost : std::string());
+  }
+  return bytes.OneEntryList();
+}
+
+// An Int32 named `leaf`, then `doublings` clusters each of two copies of the record before it;
+// the last one named `outermost`. Record i counts 2^(i + 1) - 1 descriptors when expanded.
+std::vector<uint8_t> DoublingChain(int32_t doublings, const std::string& leaf, const std::string& outermost) {
+  TypeStringBytes bytes;
+  bytes.Record(kCodeInt32, {0}, leaf);
+  for (int32_t i = 1; i <= doublings; ++i) {
+    const auto previous = static_cast<uint16_t>(i - 1);
+    bytes.Record(kCodeCluster, TypeStringBytes::U16s({2, previous, previous}),
+                 i == doublings ? outermost : std::string());
+  }
+  return bytes.OneEntryList();
+}
+
+// A Block of 0x40000000 bytes named `block`, another of `secondSize` bytes, and a cluster of the
+// two named `outermost`.
+std::vector<uint8_t> BigBlocks(uint32_t secondSize, const std::string& block, const std::string& outermost) {
+  TypeStringBytes bytes;
+  bytes.Record(kCodeBlock, TypeStringBytes::U32(0x40000000), block);
+  uint16_t second = 0;
+  if (secondSize != 0x40000000) {
+    bytes.Record(kCodeBlock, TypeStringBytes::U32(secondSize));
+    second = 1;
+  }
+  bytes.Record(kCodeCluster, TypeStringBytes::U16s({2, 0, second}), outermost);
+  return bytes.OneEntryList();
+}
+
+// What the interning dictionaries hold, after a collection has dropped what nobody uses.
+struct InternedCounts {
+  uint32_t types;
+  uint32_t names;
+  bool operator==(const InternedCounts&) const = default;
+};
+
+InternedCounts CollectAndCount() {
+  GarbageCollectDictionaries();
+  return {GTDDictionary().Size(), TheNameDictionary().Size()};
+}
+
+struct LimitCase {
+  const char* name;
+  std::vector<uint8_t> bytes;
+  const char* message;
+  // Records before the refused one, each new and interned by the load; only the first is named.
+  uint32_t completeRecords;
+};
+
+TEST_F(TD80ReadWriteTest, StringsBeyondTheLimitsAreRefusedAndLeaveNothingBehind) {
+  const LimitCase kCases[] = {
+      {"Nesting", ClusterChain(257, "innermost-a", "refused-a"),
+       "Type string refused: nesting deeper than 256 levels", 256},
+      {"Expansion", DoublingChain(24, "leaf-b", "refused-b"),
+       "Type string refused: more than 16777216 descriptors when expanded", 24},
+      {"DataSize", BigBlocks(0x40000000, "block-c", "refused-c"),
+       "Type string refused: data size does not fit in 31 bits", 1},
+  };
+  for (const LimitCase& c : kCases) {
+    SCOPED_TRACE(c.name);
+    const InternedCounts before = CollectAndCount();
+    DebugCapture capture;
+    const auto start = std::chrono::steady_clock::now();
+    TDR out;
+    EXPECT_EQ(Load(c.bytes, &out), kStatusOutOfMemory);
+    const double ms = std::chrono::duration<double, std::milli>(std::chrono::steady_clock::now() - start).count();
+    std::printf("%s refused in %.2f ms\n", c.name, ms);
+    EXPECT_FALSE(out);
+    EXPECT_EQ(capture.Texts(), std::vector<std::string>{c.message});
+    // The complete records were interned and nothing of the refused one: not even its name,
+    // which no other record uses.
+    EXPECT_EQ(GTDDictionary().Size(), before.types + c.completeRecords);
+    EXPECT_EQ(TheNameDictionary().Size(), before.names + 1);
+    EXPECT_EQ(CollectAndCount(), before);
+  }
+}
+
+TEST_F(TD80ReadWriteTest, StringsAtTheLimitsLoad) {
+  TDR deep;
+  ASSERT_EQ(Load(ClusterChain(256, "innermost", ""), &deep), kStatusNoError);
+  int32_t levels = 1;
+  for (TDR level = deep; level.IsClust() != 0; level = TDRCluster(level.GetImpPtr(), 1).GetEltTD(0)) ++levels;
+  EXPECT_EQ(levels, 256);
+
+  // 2^24 - 1 descriptors when expanded.
+  TDR wide;
+  ASSERT_EQ(Load(DoublingChain(23, "leaf", ""), &wide), kStatusNoError);
+  EXPECT_EQ(wide.DataSize(), 4 << 23);
+
+  TDR big;
+  ASSERT_EQ(Load(BigBlocks(0x3FFFFFFE, "block", ""), &big), kStatusNoError);
+  EXPECT_EQ(big.DataSize(), 0x7FFFFFFE);
+}
+
+// --- recursion on a small stack ----------------------------------------------------------------------
+
+constexpr uint8_t kStackPattern = 0xA5;
+
+// The bytes at the low end of the stack that nothing wrote. Reads memory the sanitizer may still
+// consider the exited thread's.
+__attribute__((no_sanitize("address"))) size_t UntouchedBytes(const uint8_t* low, size_t size) {
+  size_t n = 0;
+  while (n < size && low[n] == kStackPattern) ++n;
+  return n;
+}
+
+// Runs `work` on a thread of its own whose stack is `size` bytes with an inaccessible page below,
+// so that an overflow faults at once, and answers how many bytes of the stack were written (the
+// thread's own bookkeeping at its top included).
+size_t RunOnStack(size_t size, const std::function<void()>& work) {
+  const auto page = static_cast<size_t>(sysconf(_SC_PAGESIZE));
+  void* region = mmap(nullptr, size + page, PROT_READ | PROT_WRITE, MAP_PRIVATE | MAP_ANONYMOUS | MAP_STACK, -1, 0);
+  if (region == MAP_FAILED) {
+    ADD_FAILURE() << "no memory for the stack";
+    return 0;
+  }
+  auto* low = static_cast<uint8_t*>(region) + page;
+  EXPECT_EQ(mprotect(region, page, PROT_NONE), 0);
+  std::memset(low, kStackPattern, size);
+  pthread_attr_t attributes;
+  pthread_attr_init(&attributes);
+  EXPECT_EQ(pthread_attr_setstack(&attributes, low, size), 0);
+  pthread_t thread;
+  auto body = [](void* argument) -> void* {
+    (*static_cast<const std::function<void()>*>(argument))();
+    return nullptr;
+  };
+  EXPECT_EQ(pthread_create(&thread, &attributes, body, const_cast<std::function<void()>*>(&work)), 0);
+  pthread_join(thread, nullptr);
+  pthread_attr_destroy(&attributes);
+  const size_t used = size - UntouchedBytes(low, size);
+  munmap(region, size + page);
+  return used;
+}
+
+constexpr size_t kSmallStack = size_t{1} << 20;
+constexpr int32_t kDeepLevels = 256;
+
+// A writable chain of kDeepLevels levels around a variable String named `innermost`; `wrap`
+// makes level i (1 and up) around the level below.
+TDW BuildChain(const std::string& innermost, const std::function<TDW(int32_t, const TDW&)>& wrap) {
+  TDW level = TDWString(U(innermost.c_str()), vellum::bound::kVariable);
+  for (int32_t i = 1; i < kDeepLevels; ++i) level = wrap(i, level);
+  return level;
+}
+
+TDW ClusterAround(const TDW& inner) {
+  TDWCluster cluster;
+  cluster << inner;
+  return cluster;
+}
+
+struct DeepCase {
+  const char* name;
+  std::function<TDW(int32_t, const TDW&)> wrap;
+};
+
+TEST_F(TD80ReadWriteTest, EveryWalkOverTheDeepestDescriptorFitsASmallStack) {
+  const DeepCase kCases[] = {
+      {"clusters", [](int32_t, const TDW& inner) { return ClusterAround(inner); }},
+      // Kinds whose data holds the level below in place.
+      {"blocks", [](int32_t i, const TDW& inner) -> TDW {
+         switch (i % 3) {
+           case 0: {
+             TDWRepeatedBlock repeated;
+             repeated.SetEltTD(inner);
+             repeated.SetNumBlocks(1);
+             return repeated;
+           }
+           case 1: {
+             TDWTypeBlock block;
+             block.SetEltTD(inner);
+             return block;
+           }
+           default: {
+             TDWCluster cluster;
+             cluster << TDWInt8() << inner;
+             return cluster;
+           }
+         }
+       }},
+      // Kinds that refer to the level below only through the descriptor.
+      {"pointers", [](int32_t i, const TDW& inner) -> TDW {
+         switch (i % 4) {
+           case 1: return TDWArray(1, inner);
+           case 3: {
+             TDWAlignmentMarker marker;
+             marker.SetAlignmentSource(inner);
+             return marker;
+           }
+           default: {
+             TDWPtrTo pointer;
+             pointer.SetEltTD(inner);
+             return pointer;
+           }
+         }
+       }},
+  };
+  SetDSAlign(8);  // alignment walks stop at once when everything is packed
+  const size_t baseline = RunOnStack(kSmallStack, [] {});
+  for (const DeepCase& c : kCases) {
+    SCOPED_TRACE(c.name);
+    const std::string innermost = std::string("deep innermost ") + c.name;
+    const InternedCounts before = CollectAndCount();
+    TDW separate;
+    TDR deep;
+    std::vector<uint8_t> bytes;
+    TDR loaded;
+    const std::vector<std::pair<const char*, std::function<void()>>> kSteps = {
+        {"build", [&] {
+           separate = BuildChain(innermost, c.wrap);
+           deep = BuildChain(innermost, c.wrap).CheckIn();
+         }},
+        {"flatten", [&] {
+           UHandle h = nullptr;
+           ASSERT_EQ(FlattenOneType(nullptr, deep, &h, nullptr), kStatusNoError);
+           bytes.assign(*h, *h + DSGetHandleSize(h));
+           DSDisposeHandle(h);
+           if (std::string(c.name) == "clusters") {
+             EXPECT_EQ(bytes, ClusterChain(kDeepLevels, innermost, ""));
+           }
+         }},
+        {"load", [&] { ASSERT_EQ(Load(bytes, &loaded), kStatusNoError); }},
+        {"compare", [&] {
+           EXPECT_EQ(loaded, deep);
+           EXPECT_EQ(deep.IsSameAs(separate), 1);
+           EXPECT_EQ(separate.IsSameAs(deep), 1);
+           EXPECT_EQ(deep.CmpTD(separate, 0), 0);
+           EXPECT_EQ(separate.CmpTD(deep, 0), 0);
+         }},
+        {"hash", [&] { EXPECT_EQ(separate.GetHashValue(), deep.GetHashValue()); }},
+        {"check in", [&] { EXPECT_EQ(separate.CheckIn(), deep); }},
+        {"layout", [&] {
+           EXPECT_EQ(separate.DataSize(), deep.DataSize());
+           EXPECT_EQ(separate.GetAlignment(), deep.GetAlignment());
+           TestPlatform platform(4, 0, 4);
+           EXPECT_EQ(separate.DataSize(&platform), deep.DataSize(&platform));
+           EXPECT_EQ(deep.GetAlignment(&platform), separate.GetAlignment(&platform));
+         }},
+        {"text", [&] {
+           EXPECT_NE(ToString(deep), "");
+           EXPECT_NE(TypeToInterpretedString(deep), "");
+           DebugCapture capture;
+           deep.PrintDebugStr();
+           EXPECT_GT(capture.Messages().size(), static_cast<size_t>(kDeepLevels));
+         }},
+        {"traverse", [&] {
+           int32_t visited = 0;
+           deep.TraverseTDR(
+               [](const TDR&, void* count) -> TDTraverseValue {
+                 ++*static_cast<int32_t*>(count);
+                 return kTraverseContinue;
+               },
+               &visited, nullptr);
+           EXPECT_GE(visited, kDeepLevels);
+           EXPECT_EQ(deep.ContainsTypedef(), 0);
+         }},
+        {"data", [&] {
+           const auto size = static_cast<size_t>(deep.DataSize());
+           std::vector<uint64_t> a(size / 8 + 1, 0);
+           std::vector<uint64_t> b(size / 8 + 1, 0);
+           auto* first = reinterpret_cast<uint8_t*>(a.data());
+           auto* second = reinterpret_cast<uint8_t*>(b.data());
+           ASSERT_EQ(deep.InflateDefData(first, 0, 1, 0), kStatusNoError);
+           ASSERT_EQ(deep.InflateDefData(second, 0, 1, 0), kStatusNoError);
+           ASSERT_EQ(deep.CopyData(first, second, nullptr, 0), kStatusNoError);
+           EXPECT_EQ(deep.VerifyData(second, nullptr), kStatusNoError);
+           EXPECT_EQ(deep.ResetToDefaultData(second), kStatusNoError);
+           deep.DeflateData(first, first + size, 1, NormalHandleAllocator());
+           deep.DeflateData(second, second + size, 1, NormalHandleAllocator());
+         }},
+        {"release", [&] {
+           separate = TDW();
+           deep = TDR();
+           loaded = TDR();
+           GarbageCollectDictionaries();
+         }},
+    };
+    // How much of the stack each step took, for the record.
+    std::string figures = std::string(c.name) + ", bytes of stack:";
+    for (const auto& [step, work] : kSteps) {
+      const size_t used = RunOnStack(kSmallStack, work);
+      figures += std::string(" ") + step + " " + std::to_string(used > baseline ? used - baseline : 0) + ";";
+    }
+    std::printf("%s\n", figures.c_str());
+    EXPECT_EQ(CollectAndCount(), before);
+  }
+  SetDSAlign(0);
 }
 
 // --- versions ----------------------------------------------------------------------------------------

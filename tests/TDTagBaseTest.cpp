@@ -186,6 +186,33 @@ TEST_F(TDTagBaseTest, DebugDump) {
   EXPECT_EQ(texts[6], "\ttagClass = Cls");
 }
 
+TEST_F(TDTagBaseTest, StoredKindsOutsideTheValidOnesAreReported) {
+  struct KindCase {
+    const char* name;
+    TagType saved;
+    TagType loaded;
+    std::vector<std::string> messages;
+  };
+  const KindCase kCases[] = {
+      {"Valid", 23, 23, {}},
+      {"SwappedOne", 0x0100, 1, {"invalid tag type:256", "replacing invalid tag type:256 with:1"}},
+      {"SwappedLast", 0x1700, 23, {"invalid tag type:5888", "replacing invalid tag type:5888 with:23"}},
+      {"BeyondTheKinds", 24, 24, {"invalid tag type:24"}},
+      {"Zero", 0, 0, {"invalid tag type:0"}},
+  };
+  for (const KindCase& c : kCases) {
+    SCOPED_TRACE(c.name);
+    UHandle h = nullptr;
+    ASSERT_EQ(FlattenOneType(nullptr, TDRTag(c.saved, nullptr), &h, nullptr), kStatusNoError);
+    DebugCapture capture;
+    TDR loaded;
+    EXPECT_EQ(UnFlattenOneType(nullptr, h, &loaded, nullptr), kStatusNoError);
+    DSDisposeHandle(h);
+    EXPECT_EQ(TDRTag(loaded.GetImpPtr(), 1).GetTagType(), c.loaded);
+    EXPECT_EQ(capture.Texts(), c.messages);
+  }
+}
+
 TEST_F(TDTagBaseTest, CheckOutWithAClassSurvivesAllocationFailures) {
   const TDRUserDefinedTag widget(U("\x06Widget"));
   for (int64_t nth = 1; nth < 50; ++nth) {
