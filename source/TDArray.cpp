@@ -1790,8 +1790,9 @@ namespace {
 
 // Booleans of streams before this version are packed sixteen to a word, a new word each row.
 constexpr uint32_t kOneByteBooleanVersion = 0x04502004;
-// Skipping values that take no input costs time only: so many are enough for any real stream.
-constexpr int64_t kMaxEmptyValuesSkipped = int64_t{1} << 24;
+// Values that take no input (pointers, empty clusters) cost time only: so many are enough for any
+// real stream.
+constexpr int64_t kMaxEmptyValues = int64_t{1} << 20;
 
 bool PacksBooleans(const TDImp& element, uint32_t version) {
   return element.IsBool() != 0 && version < kOneByteBooleanVersion;
@@ -1866,7 +1867,11 @@ int32_t ReadElements(KoDataReader* reader, const ArrayLayout& layout, uint8_t* f
                      const int32_t* sizes, int64_t count) {
   if (PacksBooleans(*layout.elt, reader->GetVersion())) return ReadPackedBooleans(reader, first, nDims, sizes, count);
   if (count == 0) return reader->GetError();
-  if (first == nullptr && MinFlatSize(*layout.elt, reader->GetVersion()) == 0 && count > kMaxEmptyValuesSkipped) {
+  // Values that take no input cost time only; a count the input does not pay for is refused.
+  if (count > kMaxEmptyValues && MinFlatSize(*layout.elt, reader->GetVersion()) == 0) {
+    (VELLUM_DEBUG(2) << "ReadData: " << count << " array elements that take no input are more than "
+                     << kMaxEmptyValues)
+        .Process();
     reader->SetError(kStatusImplausibleData);
     return reader->GetError();
   }
