@@ -6,6 +6,7 @@
 #include "vellum/TDArrayHandles.h"
 #include "vellum/TDAttributeHandles.h"
 #include "vellum/TDBlockHandles.h"
+#include "vellum/TDCompare.h"
 #include "vellum/TDContainerHandles.h"
 #include "vellum/TDEnumHandles.h"
 #include "vellum/TDHandles.h"

@@ -132,18 +132,6 @@ int64_t PackedWordsOfSizes(int32_t nDims, const int32_t* words) {
 // What a default (or reset) block holds in a dimension word: the fixed size, else 0.
 int32_t DefaultWord(int32_t word) { return IsFixed(word) ? Length(word) : 0; }
 
-// The element count of a block, when the block holds its dimension words and its elements.
-bool ReadBlock(const ArrayLayout& layout, UHandle h, int64_t* count, size_t* size = nullptr) {
-  const size_t bytes = DSGetHandleSize(h);
-  if (size != nullptr) *size = bytes;
-  if (static_cast<int64_t>(bytes) < kDimWordSize * layout.nDims) return false;
-  int32_t overflow = 0;
-  *count = NArrayElts(layout.nDims, DimsOf(h), &overflow);
-  if (overflow != 0) return false;
-  const int64_t need = *count == 0 ? kDimWordSize * layout.nDims : layout.header + layout.Bytes(*count, DimsOf(h));
-  return static_cast<int64_t>(bytes) >= need;
-}
-
 // --- the element test of resizing ----------------------------------------------------------------
 
 std::atomic<NeedsInflateForArrayEltsProc> gNeedsInflateProc{nullptr};
@@ -202,7 +190,7 @@ int32_t ResizeElements(const ArrayLayout& layout, UHandle* h, int64_t newCount, 
   bool created = false;
   if (*h != nullptr) {
     size_t size = 0;
-    if (!ReadBlock(layout, *h, &oldCount, &size)) {
+    if (!layout.ReadCount(*h, &oldCount, &size)) {
       ReportTooLarge(who, static_cast<int64_t>(size) >= kDimWordSize * layout.nDims ? RawProduct(layout.nDims, DimsOf(*h)) : 0);
       return kStatusBadArgument;
     }
@@ -304,7 +292,7 @@ int32_t CopyFlatBlock(const ArrayLayout& layout, UHandle src, UHandle* dst) {
   if (src == *dst) return kStatusNoError;
   int64_t count = 0;
   size_t size = 0;
-  if (!ReadBlock(layout, src, &count, &size)) {
+  if (!layout.ReadCount(src, &count, &size)) {
     ReportDamagedBlock();
     return kStatusBadArgument;
   }
@@ -350,7 +338,7 @@ bool ArraySource(const ArrayLayout& layout, const void* data, Source* source) {
   source->handle = Load<UHandle>(data);
   if (source->handle == nullptr) return true;
   int64_t count = 0;
-  if (!ReadBlock(layout, source->handle, &count)) {
+  if (!layout.ReadCount(source->handle, &count)) {
     ReportDamagedBlock();
     return false;
   }
@@ -594,6 +582,25 @@ void UnpackBooleans(const uint8_t* words, uint8_t* bytes, int64_t rows, int64_t 
 
 }  // namespace
 
+int32_t ComparePackedBooleans(const uint8_t* a, const uint8_t* b, int64_t rows, int64_t rowLength) {
+  const int64_t wordsPerRow = (rowLength + 15) >> 4;
+  for (int64_t r = 0; r < rows; ++r) {
+    for (int64_t w = 0; w < wordsPerRow; ++w) {
+      const int64_t at = 2 * (r * wordsPerRow + w);
+      // The bits past the end of a row are not elements; whatever they hold does not count.
+      const int64_t used = std::min<int64_t>(16, rowLength - 16 * w);
+      const auto mask = static_cast<uint16_t>(0xFFFFu << (16 - used));
+      const auto x = static_cast<uint16_t>(Load<uint16_t>(a + at) & mask);
+      const auto y = static_cast<uint16_t>(Load<uint16_t>(b + at) & mask);
+      if (x == y) continue;
+      // The most significant differing bit is the first differing element.
+      const auto first = static_cast<uint16_t>(0x8000u >> std::countl_zero(static_cast<uint16_t>(x ^ y)));
+      return (x & first) != 0 ? 1 : -1;
+    }
+  }
+  return 0;
+}
+
 // --- counting ------------------------------------------------------------------------------------
 
 int64_t NArrayElts(int32_t nDims, const int32_t* dims, int32_t* overflow) {
@@ -691,6 +698,19 @@ ArrayLayout::ArrayLayout(const TDImp& element, int32_t dimensions)
       header(element.AlignDatumCore(kDimWordSize * dimensions, nullptr)),
       handles(element.DataShapeOf(1) != kDataShapePlain),
       packed(element.IsBoolU16() != 0) {}
+
+bool ArrayLayout::ReadCount(UHandle h, int64_t* count, size_t* size) const {
+  const size_t bytes = DSGetHandleSize(h);
+  if (size != nullptr) *size = bytes;
+  // An empty size is also what a handle that is not live answers; its block is never read.
+  if (bytes == 0 && IsDSHandle(h) == 0) return false;
+  if (static_cast<int64_t>(bytes) < kDimWordSize * nDims) return false;
+  int32_t overflow = 0;
+  *count = NArrayElts(nDims, DimsOf(h), &overflow);
+  if (overflow != 0) return false;
+  const int64_t need = *count == 0 ? kDimWordSize * nDims : header + Bytes(*count, DimsOf(h));
+  return static_cast<int64_t>(bytes) >= need;
+}
 
 int64_t ArrayLayout::Bytes(int64_t count, const int32_t* dims) const {
   if (!packed) return count * eltSize;
@@ -1048,7 +1068,7 @@ int32_t TDArrayImp::InflateDefData(void* data, int32_t onlyIfEmpty, int32_t clea
   if (onlyIfEmpty != 0 && h != nullptr) {
     if (!layout.handles) return kStatusNoError;
     int64_t count = 0;
-    if (!ReadBlock(layout, h, &count)) {
+    if (!layout.ReadCount(h, &count)) {
       ReportDamagedBlock();
       return kStatusBadArgument;
     }
@@ -1165,7 +1185,7 @@ int32_t TDArrayImp::VerifyData(const void* data, const KoContext* context) const
   const ArrayLayout layout(*GetElt(), GetNumDims());
   // Nothing is read before the handle is known to be live and large enough for what is read.
   int64_t count = 0;
-  if (IsDSHandle(h) == 0 || !ReadBlock(layout, h, &count)) return ReportDamagedData(*this, data);
+  if (IsDSHandle(h) == 0 || !layout.ReadCount(h, &count)) return ReportDamagedData(*this, data);
   bool overflow = false;
   const int32_t word = CountWord(&overflow);
   if (word != -1) {
@@ -1270,7 +1290,7 @@ int32_t CopyElementwise(const ArrayLayout& layout, const void* src, void* dst, i
   UHandle into = Load<UHandle>(dst);
   if (from != nullptr && from == into) return kStatusNoError;
   int64_t count = 0;
-  if (from != nullptr && !ReadBlock(layout, from, &count)) {
+  if (from != nullptr && !layout.ReadCount(from, &count)) {
     ReportDamagedBlock();
     return kStatusBadArgument;
   }
@@ -1295,7 +1315,7 @@ int32_t CopyBooleanForm(const TDArrayImp& type, const ArrayLayout& layout, int32
     return kStatusBadArgument;
   }
   int64_t count = 0;
-  if (from != nullptr && !ReadBlock(layout, from, &count)) {
+  if (from != nullptr && !layout.ReadCount(from, &count)) {
     ReportDamagedBlock();
     return kStatusBadArgument;
   }

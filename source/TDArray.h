@@ -24,6 +24,9 @@ struct ArrayLayout {
   // The bytes of `count` elements; with `dims` (the block's dimension words) exact for packed
   // elements, without them an upper bound.
   int64_t Bytes(int64_t count, const int32_t* dims) const;
+  // The element count of block `h` into *count (and its size into *size): false when the block
+  // is not live, or is smaller than its dimension words say, or their product overflows.
+  bool ReadCount(UHandle h, int64_t* count, size_t* size = nullptr) const;
   uint8_t* Element(uint8_t* block, int64_t index) const { return block + header + index * eltSize; }
   const uint8_t* Element(const uint8_t* block, int64_t index) const { return block + header + index * eltSize; }
 };
@@ -174,6 +177,11 @@ class TDArrayDataPtrImp final : public TDArrayBaseImp {
  protected:
   const char* KindText() const override { return "array data pointer"; }
 };
+
+// The order of two blocks of packed Booleans of `rows` rows of `rowLength` elements (the layout
+// of BooleanU16 arrays): at the first differing element, 1 when a's is true, else -1; 0 when all
+// are equal.
+int32_t ComparePackedBooleans(const uint8_t* a, const uint8_t* b, int64_t rows, int64_t rowLength);
 
 // The array side of `type`; null when it is not an array kind.
 const TDArrayBaseImp* AsArrayBase(const TDImp* type);

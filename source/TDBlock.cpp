@@ -49,10 +49,6 @@ const TDSizedBlockImp* AsSizedBlock(const TDImp* type) {
   return type != nullptr && type->IsSizedBlock() != 0 ? static_cast<const TDSizedBlockImp*>(type) : nullptr;
 }
 
-const TDRepeatedBlockImp* AsRepeatedBlock(const TDImp* type) {
-  return type != nullptr && type->IsRepeatedBlock() != 0 ? static_cast<const TDRepeatedBlockImp*>(type) : nullptr;
-}
-
 // The element's comparison for block containers whose elements describe the bytes.
 int32_t CompareElements(const TDSingleContainerImp& mine, const TDImp* source, int32_t flags) {
   const TDSingleContainerImp* other = AsSingleContainer(source);
@@ -85,6 +81,10 @@ const bool gAnnounced = [] {
 uint8_t* At(void* data, int64_t offset) { return static_cast<uint8_t*>(data) + offset; }
 
 }  // namespace
+
+const TDRepeatedBlockImp* AsRepeatedBlock(const TDImp* type) {
+  return type != nullptr && type->IsRepeatedBlock() != 0 ? static_cast<const TDRepeatedBlockImp*>(type) : nullptr;
+}
 
 // --- TDSizedBlockImp -------------------------------------------------------------------------------
 

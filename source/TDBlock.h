@@ -197,3 +197,6 @@ class TDRepeatedBlockImp final : public TDBlockContainerImp {
 
   uint32_t numBlocks_ = 0;
 };
+
+// The repeated-block side of `type`; null when it is not a repeated block.
+const TDRepeatedBlockImp* AsRepeatedBlock(const TDImp* type);

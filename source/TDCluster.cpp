@@ -280,6 +280,26 @@ int32_t TDClusterImp::GetNumEltsDeep() const {
   return deep;
 }
 
+int32_t TDClusterImp::ForEachEltOffset(EltOffsetVisit visit, void* context) const {
+  const bool recorded = HasRecordedLayout();
+  EltCursor cursor(*this, nullptr);
+  const int32_t count = GetNumElts();
+  for (int32_t i = 0; i < count; ++i) {
+    int64_t offset = 0;
+    if (recorded) {
+      offset = offsets_[static_cast<size_t>(i)];
+    } else {
+      cursor.Next();
+      offset = cursor.Offset();
+    }
+    const TDImp* element = GetEltImpPtr(i).get();
+    if (element == nullptr) continue;
+    const int32_t result = visit(context, *element, offset);
+    if (result != 0) return result;
+  }
+  return 0;
+}
+
 // --- recorded layout -------------------------------------------------------------------------------
 
 int32_t TDClusterImp::MemberCheckIn(TDImpPtr& target) const {

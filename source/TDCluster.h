@@ -4,6 +4,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <type_traits>
 #include <vector>
 
 #include "source/TDContainer.h"
@@ -61,7 +62,22 @@ class TDClusterImp : public TDMultiContainerImp {
   virtual int32_t GetEltOffset(int32_t index, ITargetPlatformAlignment* platform) const;
   virtual int32_t GetNumEltsDeep() const;
 
+  // Calls `visit(element, offset)` for each present element in order, with its offset in a datum
+  // of the running process, while it returns 0; the first other value. The recorded layout
+  // serves when it holds, so the walk is linear either way.
+  template <class Visit>
+  int32_t ForEachElt(Visit&& visit) const {
+    return ForEachEltOffset(
+        [](void* context, const TDImp& element, int64_t offset) {
+          return (*static_cast<std::remove_reference_t<Visit>*>(context))(element, offset);
+        },
+        &visit);
+  }
+
  private:
+  using EltOffsetVisit = int32_t (*)(void* context, const TDImp& element, int64_t offset);
+  int32_t ForEachEltOffset(EltOffsetVisit visit, void* context) const;
+
   // One step of a walk over a datum: an element with handles, or (element null) a run of bytes
   // without handles that is copied or cleared as it is.
   struct DataStep {

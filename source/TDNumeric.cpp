@@ -599,12 +599,24 @@ int32_t TDBasicNumericImp::CompareData(const void* a, const void* b) const {
     case TypeCode::Float32:
     case TypeCode::Float64:
     case TypeCode::FloatExt: {
-      // NaN orders by class: after every other value, equal to another NaN.
+      // NaN orders by class: after every other value, equal to another NaN. Only the class of a
+      // NaN (3) decides, so the common case of two numbers asks for no classes.
+      auto byClass = [&] {
+        return ClassifyFloatNumber(static_cast<int32_t>(code), a) - ClassifyFloatNumber(static_cast<int32_t>(code), b);
+      };
+      if (code == TypeCode::Float32) {
+        const float x = load(a, float{});
+        const float y = load(b, float{});
+        return std::isnan(x) || std::isnan(y) ? byClass() : order(x, y);
+      }
+      if (code == TypeCode::Float64) {
+        const double x = load(a, double{});
+        const double y = load(b, double{});
+        return std::isnan(x) || std::isnan(y) ? byClass() : order(x, y);
+      }
       const int32_t classA = ClassifyFloatNumber(static_cast<int32_t>(code), a);
       const int32_t classB = ClassifyFloatNumber(static_cast<int32_t>(code), b);
       if (classA == kFloatClassNaN || classB == kFloatClassNaN) return classA - classB;
-      if (code == TypeCode::Float32) return order(load(a, float{}), load(b, float{}));
-      if (code == TypeCode::Float64) return order(load(a, double{}), load(b, double{}));
       return order(ExtendedToLongDouble(static_cast<const uint8_t*>(a)),
                    ExtendedToLongDouble(static_cast<const uint8_t*>(b)));
     }
@@ -902,6 +914,11 @@ TDImpPtr vellum::detail::NewBasicNumeric(TypeCode code, const uint8_t* name, con
   return fresh;
 }
 
+int32_t CompareNumericData(const TDImp* type, const void* a, const void* b) {
+  const TDNumericImp* numeric = AsNumeric(type);
+  return numeric != nullptr ? numeric->CompareData(a, b) : 0;
+}
+
 namespace vellum::numeric {
 
 namespace {
@@ -939,9 +956,7 @@ void InitializeData(const TD& type, void* data) {
   if (Numeric(type) != nullptr) Numeric(type)->InitializeData(data);
 }
 
-int32_t CompareData(const TD& type, const void* a, const void* b) {
-  return Numeric(type) != nullptr ? Numeric(type)->CompareData(a, b) : 0;
-}
+int32_t CompareData(const TD& type, const void* a, const void* b) { return CompareNumericData(type.GetImp(), a, b); }
 
 int32_t ConvertFromNumeric(const TD& type, const TD& src, const void* srcData, void* dstData) {
   if (Numeric(type) == nullptr || Numeric(src) == nullptr || srcData == nullptr || dstData == nullptr) return 0;

@@ -211,5 +211,9 @@ using TDComplexExtImp = TDBasicNumericKindImp<TypeCode::ComplexExt>;
 // "Not yet supported" for the 64-bit integers, 0 after "Bad tc" for any other code.
 int32_t DecimalDigitsForAutoPrecisionOfCode(int32_t code);
 
+// The order of two values of numeric `type` (TDNumericImp::CompareData); 0 when `type` is null or
+// not numeric.
+int32_t CompareNumericData(const TDImp* type, const void* a, const void* b);
+
 // The shared "Event Type" enumeration (59 items) that event enumerations convert into.
 const TDR& GetEventTypeTD();
