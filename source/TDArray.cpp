@@ -1958,7 +1958,7 @@ uint32_t TDArrayImp::FlatDataSize(KoDataWriter* writer, const void* data) const 
   const ArrayLayout layout(*GetElt(), nDims);
   const UHandle h = Load<UHandle>(data);
   int64_t count = 0;
-  if (h == nullptr || !ReadBlock(layout, h, &count)) return static_cast<uint32_t>(size);
+  if (h == nullptr || !layout.ReadCount(h, &count)) return static_cast<uint32_t>(size);
   const uint32_t version = writer != nullptr ? writer->GetVersion() : PXApp::Instance().GetVersion();
   if (PacksBooleans(*layout.elt, version)) {
     size += 2 * static_cast<uint64_t>(PackedWords(nDims, DimsOf(h)));
@@ -1987,7 +1987,7 @@ int32_t TDArrayImp::WriteData(KoDataWriter* writer, const void* data, int32_t co
     }
     const ArrayLayout layout(*GetElt(), nDims);
     int64_t elements = 0;
-    if (!ReadBlock(layout, h, &elements)) {
+    if (!layout.ReadCount(h, &elements)) {
       ReportDamagedBlock();
       writer->SetError(kStatusBadArgument);
       break;
