@@ -1954,12 +1954,26 @@ int32_t ReadIntoPreallocated(KoDataReader* reader, const TDArrayImp& type, const
 uint32_t TDArrayImp::FlatDataSize(KoDataWriter* writer, const void* data) const {
   const int32_t nDims = GetNumDims();
   uint64_t size = 4 * static_cast<uint64_t>(nDims);
-  if (data == nullptr || !IsWellFormed()) return static_cast<uint32_t>(size);
+  if (!IsWellFormed()) return static_cast<uint32_t>(size);
+  const uint32_t version = writer != nullptr ? writer->GetVersion() : PXApp::Instance().GetVersion();
+  if (data == nullptr) {
+    // Without data only a fixed array knows its elements: every value has them all.
+    if (IsFlatDataFixedSize() == 0) return static_cast<uint32_t>(size);
+    bool overflow = false;
+    const int64_t count = CountWord(&overflow) & 0x7FFFFFFF;
+    if (PacksBooleans(*GetElt(), version)) {
+      std::vector<int32_t> sizes(static_cast<size_t>(nDims));
+      for (int32_t d = 0; d < nDims; ++d) sizes[static_cast<size_t>(d)] = vellum::bound::Length(GetDimSize(d));
+      size += 2 * static_cast<uint64_t>(PackedWords(nDims, sizes.data()));
+    } else {
+      size += static_cast<uint64_t>(count) * GetElt()->FlatDataSize(writer, nullptr);
+    }
+    return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
+  }
   const ArrayLayout layout(*GetElt(), nDims);
   const UHandle h = Load<UHandle>(data);
   int64_t count = 0;
   if (h == nullptr || !layout.ReadCount(h, &count)) return static_cast<uint32_t>(size);
-  const uint32_t version = writer != nullptr ? writer->GetVersion() : PXApp::Instance().GetVersion();
   if (PacksBooleans(*layout.elt, version)) {
     size += 2 * static_cast<uint64_t>(PackedWords(nDims, DimsOf(h)));
   } else if (layout.elt->IsFlatDataFixedSize() != 0) {
@@ -2056,6 +2070,11 @@ int32_t TDArrayImp::ReadData(KoDataReader* reader, void* data, int32_t count, in
         break;
       }
       h = Load<UHandle>(slot);
+    }
+    if (h == nullptr && capacity == 0) {
+      // No room at all: the default of such an array is no block, and every element is dropped.
+      ReadElements(reader, layout, nullptr, nDims, sizes.data(), elements);
+      continue;
     }
     if (h == nullptr || static_cast<int64_t>(DSGetHandleSize(h)) < need) {
       DebugReport(__FILE__, __LINE__, 3,

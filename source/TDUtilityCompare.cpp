@@ -20,6 +20,19 @@
 
 namespace {
 
+// Data without a path yet holds null, which flattens as not-a-path, and so compares as one.
+int32_t ComparePathData(Path a, Path b) {
+  if (a != nullptr && b != nullptr) return FPathCmpExact(a, b);
+  Path notAPath = nullptr;
+  if (FNotAPath(&notAPath) != kStatusNoError) {
+    FDestroyPath(&notAPath);
+    return FPathCmpExact(a, b);
+  }
+  const int32_t order = FPathCmpExact(a != nullptr ? a : notAPath, b != nullptr ? b : notAPath);
+  FDestroyPath(&notAPath);
+  return order;
+}
+
 constexpr size_t kTypeCodeCount = 256;
 
 struct CompareEntry {
@@ -207,7 +220,7 @@ int32_t CompareImp(const TDImp& type, bool nullFirst, const void* a, const void*
     case TypeCode::Tag:
       return LHStrCmp(Load<LStrHandle>(a), Load<LStrHandle>(b));
     case TypeCode::Path:
-      return FPathCmpExact(Load<Path>(a), Load<Path>(b));
+      return ComparePathData(Load<Path>(a), Load<Path>(b));
     case TypeCode::SubString:
     case TypeCode::SubArray:
       DebugReport(__FILE__, __LINE__, 3, "CompareData for subtypes should be implemented correctly.");

@@ -4,11 +4,13 @@
 
 #include <cmath>
 #include <cstdio>
+#include <cstdlib>
 #include <cstring>
 #include <limits>
 #include <string>
 #include <vector>
 
+#include "RandomTypes.h"
 #include "TestSupport.h"
 #include "TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
@@ -264,6 +266,70 @@ TEST_F(KoDataFlattenTest, EveryPrefixOfAGoldenValueFailsCleanly) {
     InputBuf in(bytes.data(), n);
     KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
     EXPECT_NE(reader.ReadData(type, partial.Data(), 1), kStatusNoError);
+  }
+}
+
+// --- random types and values -------------------------------------------------------------------------
+
+TEST_F(KoDataFlattenTest, RandomValuesReadBackEqualAndWriteTheSameBytes) {
+  uint32_t seed = std::random_device{}();
+  if (const char* fixed = std::getenv("VELLUM_DATA_SEED")) seed = static_cast<uint32_t>(std::strtoul(fixed, nullptr, 10));
+  std::printf("KoDataFlattenTest seed %u (set VELLUM_DATA_SEED to replay)\n", seed);
+  RecordProperty("seed", static_cast<int>(seed));
+  RandomTypes random(seed);
+  // Bounded arrays are sound only where their room is preallocated.
+  TDEnablePreAllocation(true);
+  size_t bytesWritten = 0;
+  for (int32_t round = 0; round < 2000; ++round) {
+    SCOPED_TRACE("seed " + std::to_string(seed) + " round " + std::to_string(round));
+    SetDSAlign(round % 2 == 0 ? 8 : 0);
+    TDWCluster top;
+    for (int32_t i = 0; i < 1 + random.Pick(4); ++i) top << random.Make(3);
+    const TDR type = top.CheckIn();
+    ASSERT_TRUE(type);
+    const int64_t before = DSLiveBlockCount();
+    {
+      Datum value(type);
+      random.Fill(type, static_cast<uint8_t*>(value.Data()));
+      const std::string flat = Flatten(type, value.Data());
+      ASSERT_EQ(flat.find("status"), std::string::npos) << flat;
+      Datum back(type);
+      ASSERT_EQ(Unflatten(type, flat, back.Data()), kStatusNoError) << flat;
+      EXPECT_EQ(CompareDataTDR(type, value.Data(), back.Data(), 0, 0), 0) << flat;
+      EXPECT_EQ(Flatten(type, back.Data()), flat);
+      bytesWritten += flat.size() / 3;
+    }
+    EXPECT_EQ(DSLiveBlockCount(), before);
+  }
+  SetDSAlign(0);
+  TDEnablePreAllocation(false);
+  EXPECT_GT(bytesWritten, 20000u) << "the values are too small to test much";
+}
+
+TEST_F(KoDataFlattenTest, AllocationFailuresDuringAReadLeaveNoLeak) {
+  TDWCluster record;
+  record << GetiL() << GetStringTD() << TDRArray(1, GetStringTD()) << TDRArray(2, GetfD());
+  const TDR type = record.CheckIn();
+  const std::string flat = "00 00 00 07 00 00 00 02 68 69 00 00 00 02 00 00 00 01 61 00 00 00 00 00 00 00 01 00 00 00 01 3F F0 00 00 00 00 00 00";
+  for (int64_t nth = 1;; ++nth) {
+    SCOPED_TRACE(nth);
+    ASSERT_LT(nth, 100) << "never succeeded";
+    const int64_t before = DSLiveBlockCount();
+    int32_t status = 0;
+    bool fired = false;
+    {
+      Datum value(type);
+      ScopedAllocationFailure failure(nth);
+      status = Unflatten(type, flat, value.Data());
+      fired = failure.Fired();
+    }
+    EXPECT_EQ(DSLiveBlockCount(), before);
+    if (!fired) {
+      EXPECT_EQ(status, kStatusNoError);
+      break;
+    }
+    EXPECT_TRUE(status == kStatusReadAllocationFailed || status == kStatusCorruptData || status == kStatusOutOfMemory)
+        << status;
   }
 }
 

@@ -261,7 +261,13 @@ TEST_F(TDUtilityCompareTest, PathsCompareNamesExactly) {
   EXPECT_EQ(CompareDataTDR(GetPathTD(), &lower, &upper, 0, 0), 1);
   EXPECT_EQ(CompareDataTDR(GetPathTD(), &upper, &lower, 0, 0), -1);
   EXPECT_EQ(CompareDataTDR(GetPathTD(), &lower, &lower, 0, 0), 0);
-  EXPECT_EQ(CompareDataTDR(GetPathTD(), &none, &lower, 0, 0), -1);
+  // No path yet flattens as not-a-path, and compares as one.
+  Path notAPath = nullptr;
+  ASSERT_EQ(FNotAPath(&notAPath), kStatusNoError);
+  EXPECT_EQ(CompareDataTDR(GetPathTD(), &none, &notAPath, 0, 0), 0);
+  EXPECT_EQ(CompareDataTDR(GetPathTD(), &none, &lower, 0, 0), CompareDataTDR(GetPathTD(), &notAPath, &lower, 0, 0));
+  EXPECT_NE(CompareDataTDR(GetPathTD(), &none, &lower, 0, 0), 0);
+  FDestroyPath(&notAPath);
   FDestroyPath(&lower);
   FDestroyPath(&upper);
 }
