@@ -511,3 +511,22 @@ int32_t BinDataReader::ReadExtended(uint8_t* ten) {
   std::memcpy(ten + 8, &signExponent, 2);
   return status_;
 }
+
+uint8_t* BinDataWriter::ReserveBytes(size_t n) {
+  if (status_ != 0) return nullptr;
+  if (!out_) {
+    SetError(kStatusNullHandle);
+    return nullptr;
+  }
+  uint8_t* into = out_->Extend(n);
+  if (into == nullptr && !out_->IsCounting() && n != 0) SetError(kStatusOutOfMemory);
+  return into;
+}
+
+const uint8_t* BinDataReader::TakeBytes(size_t n) {
+  if (status_ == 0 && (!in_ || in_->BytesLeft() < n)) SetError(in_ ? kStatusCorruptData : kStatusNullHandle);
+  if (status_ != 0) return nullptr;
+  const uint8_t* at = in_->Data() + in_->Position();
+  in_->Skip(n);
+  return at;
+}

@@ -4,6 +4,8 @@
 
 #include <cstddef>
 #include <cstdint>
+#include <new>
+#include <utility>
 #include <vector>
 
 #include "runtime/DSMemory.h"
@@ -85,7 +87,26 @@ class OutputBuf {
   void Rewind() { bytes_.clear(); }
 
  private:
-  std::vector<uint8_t, PXAllocator<uint8_t>> bytes_;
+  // Grows without zero-filling: Extend's callers write every byte it hands out.
+  template <class T>
+  struct GrowAllocator : PXAllocator<T> {
+    template <class U>
+    struct rebind {
+      using other = GrowAllocator<U>;
+    };
+    GrowAllocator() noexcept = default;
+    template <class U>
+    GrowAllocator(const GrowAllocator<U>&) noexcept {}
+    template <class U>
+    void construct(U* p) noexcept {
+      ::new (static_cast<void*>(p)) U;
+    }
+    template <class U, class... Args>
+    void construct(U* p, Args&&... args) {
+      ::new (static_cast<void*>(p)) U(std::forward<Args>(args)...);
+    }
+  };
+  std::vector<uint8_t, GrowAllocator<uint8_t>> bytes_;
 };
 
 // Counts bytes without storing them, to learn a size before writing.
@@ -125,6 +146,9 @@ class BinDataWriter {
   // 32-bit count and bytes; null writes count 0; a negative count is error 1.
   int32_t WriteLStr(LStrHandle h);
   int32_t WriteBytes(const void* p, size_t n);
+  // Appends n bytes for the caller to fill and gives where they start; null when the writer has
+  // failed, runs out of memory (2) or only counts bytes (they are counted).
+  uint8_t* ReserveBytes(size_t n);
   // `count` values of `size` bytes each (1, 2, 4 or 8), in the stream's order, in one piece.
   int32_t WriteValues(const void* p, size_t size, size_t count);
   // An 80-bit extended value (10 bytes as PXNumbers.h stores them) in 16 bytes: the IEEE
@@ -184,6 +208,8 @@ class BinDataReader {
   // bytes left is 74. On failure a live *h is left as the empty string, anything else as null.
   int32_t ReadLStr(LStrHandle* h);
   int32_t ReadBytes(void* dst, size_t n);
+  // Where the next n bytes of input are, consumed; null (and 74) when fewer are left.
+  const uint8_t* TakeBytes(size_t n);
   // `count` values of `size` bytes each (1, 2, 4 or 8) into native order; zeros on failure.
   int32_t ReadValues(void* dst, size_t size, size_t count);
   // The 16-byte form WriteExtended writes, into 10 bytes; zeros on failure.

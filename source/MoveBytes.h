@@ -29,6 +29,19 @@ inline void StoreAt(uint8_t* at, T value) {
 
 }  // namespace vellum_detail
 
+// A value of type T kept at any address inside a datum.
+template <class T>
+inline T Load(const void* data) {
+  T value;
+  std::memcpy(&value, data, sizeof value);
+  return value;
+}
+
+template <class T>
+inline void Store(void* data, T value) {
+  std::memcpy(data, &value, sizeof value);
+}
+
 // Moves `count` bytes from `src` to `dst`; the two may overlap. Up to 64 bytes every load is made
 // before the first store, which is what makes an overlapping move safe.
 inline void MoveBytes(void* dst, const void* src, size_t count) {

@@ -17,6 +17,7 @@
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXStrings.h"
 #include "runtime/PXApp.h"
+#include "source/MoveBytes.h"
 #include "source/KoDataReader.h"
 #include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
@@ -58,18 +59,6 @@ constexpr int32_t kCmpFlagDimensionsFree = 0x4000000;
 constexpr int32_t kCmpKindsDiffer = 0x8;
 // Element bits that still let an array's element stand for the other, non-array side.
 constexpr int32_t kCmpElementMatchBits = kCmpMinor | kCmpKindsDiffer | kCmpNeedsConversion;
-
-template <class T>
-T Load(const void* data) {
-  T value;
-  std::memcpy(&value, data, sizeof value);
-  return value;
-}
-
-template <class T>
-void Store(void* data, T value) {
-  std::memcpy(data, &value, sizeof value);
-}
 
 const uint8_t* At(const void* data, int64_t offset) { return static_cast<const uint8_t*>(data) + offset; }
 uint8_t* At(void* data, int64_t offset) { return static_cast<uint8_t*>(data) + offset; }

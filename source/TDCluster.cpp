@@ -343,7 +343,7 @@ int32_t TDClusterImp::RecordLayout() {
       std::any_of(steps_.begin(), steps_.end(), [](const DataStep& step) { return step.element != nullptr; });
   if (!handles) plainDataSize_ = DataSizeCore(nullptr);
   layoutDSAlign_ = dsAlign;
-  return kStatusNoError;
+  return RecordFlatPlan();
 }
 
 template <class Step>
@@ -663,26 +663,12 @@ const TDR& GetClust0TD() {
 
 // --- flattened data --------------------------------------------------------------------------------
 
-template <class Visit>
-void TDClusterImp::ForEachElement(Visit visit) const {
-  if (HasRecordedLayout()) {
-    const int32_t count = GetNumElts();
-    for (int32_t i = 0; i < count; ++i) {
-      const TDImp* element = GetEltImpPtr(i).get();
-      if (element != nullptr && !visit(element, static_cast<int64_t>(offsets_[static_cast<size_t>(i)]))) return;
-    }
-    return;
-  }
-  EltCursor cursor(*this, nullptr);
-  while (cursor.Next())
-    if (cursor.Element() != nullptr && !visit(cursor.Element(), cursor.Offset())) return;
-}
-
 uint32_t TDClusterImp::FlatDataSize(KoDataWriter* writer, const void* data) const {
+  if (HasFlatPlan()) return static_cast<uint32_t>(std::min<uint64_t>(PlannedFlatSize(static_cast<const uint8_t*>(data)), UINT32_MAX));
   uint64_t size = 0;
-  ForEachElement([&](const TDImp* element, int64_t offset) {
-    size += element->FlatDataSize(writer, data != nullptr ? At(data, offset) : nullptr);
-    return true;
+  ForEachElt([&](const TDImp& element, int64_t offset) {
+    size += element.FlatDataSize(writer, data != nullptr ? At(data, offset) : nullptr);
+    return 0;
   });
   return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
 }
@@ -690,15 +676,19 @@ uint32_t TDClusterImp::FlatDataSize(KoDataWriter* writer, const void* data) cons
 int32_t TDClusterImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
   const size_t start = writer->GetBytesWritten();
   if (count > 0 && data == nullptr) writer->SetError(kStatusBadArgument);
-  const int64_t stride = DataSizeCore(nullptr);
-  for (int32_t v = 0; v < count && writer->GetError() == kStatusNoError; ++v) {
-    const uint8_t* value = At(data, stride * v);
-    ForEachElement([&](const TDImp* element, int64_t offset) {
-      int32_t elementStatus = kStatusNoError;
-      element->WriteData(writer, At(value, offset), 1, &elementStatus);
-      writer->SetError(elementStatus);
-      return writer->GetError() == kStatusNoError;
-    });
+  if (HasFlatPlan() && !writer->IsOnlyDeterminingSize()) {
+    if (writer->GetError() == kStatusNoError) WriteWithPlan(writer, data, count);
+  } else {
+    const int64_t stride = DataSizeCore(nullptr);
+    for (int32_t v = 0; v < count && writer->GetError() == kStatusNoError; ++v) {
+      const uint8_t* value = At(data, stride * v);
+      ForEachElt([&](const TDImp& element, int64_t offset) {
+        int32_t elementStatus = kStatusNoError;
+        element.WriteData(writer, At(value, offset), 1, &elementStatus);
+        writer->SetError(elementStatus);
+        return writer->GetError();
+      });
+    }
   }
   if (status != nullptr) *status = writer->GetError();
   return static_cast<int32_t>(writer->GetBytesWritten() - start);
@@ -706,16 +696,174 @@ int32_t TDClusterImp::WriteData(KoDataWriter* writer, const void* data, int32_t 
 
 int32_t TDClusterImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
   const size_t start = reader->Position();
-  const int64_t stride = DataSizeCore(nullptr);
-  for (int32_t v = 0; v < count && reader->GetError() == kStatusNoError; ++v) {
-    uint8_t* value = data != nullptr ? At(data, stride * v) : nullptr;
-    ForEachElement([&](const TDImp* element, int64_t offset) {
-      int32_t elementStatus = reader->GetError();
-      element->ReadData(reader, value != nullptr ? At(value, offset) : nullptr, 1, &elementStatus);
-      reader->SetError(elementStatus);
-      return reader->GetError() == kStatusNoError;
-    });
+  if (HasFlatPlan() && data != nullptr) {
+    if (reader->GetError() == kStatusNoError) ReadWithPlan(reader, data, count);
+  } else {
+    const int64_t stride = DataSizeCore(nullptr);
+    for (int32_t v = 0; v < count && reader->GetError() == kStatusNoError; ++v) {
+      uint8_t* value = data != nullptr ? At(data, stride * v) : nullptr;
+      ForEachElt([&](const TDImp& element, int64_t offset) {
+        int32_t elementStatus = reader->GetError();
+        element.ReadData(reader, value != nullptr ? At(value, offset) : nullptr, 1, &elementStatus);
+        reader->SetError(elementStatus);
+        return reader->GetError();
+      });
+    }
   }
   if (status != nullptr) *status = reader->GetError();
   return static_cast<int32_t>(reader->Position() - start);
+}
+
+// --- the flat plan ---------------------------------------------------------------------------------
+
+namespace {
+
+// The part size of a plain number kind whose flattened form is its bytes in the stream's order;
+// 0 for any other kind. Complex kinds count their parts.
+int32_t PlainNumberParts(const TDImp& element, uint8_t* partSize) {
+  if (element.IsBasicNumeric() == 0) return 0;
+  switch (static_cast<TypeCode>(element.GetTypeCode() & ~0x10)) {
+    case TypeCode::Int8:
+    case TypeCode::UInt8: *partSize = 1; return 1;
+    case TypeCode::Int16:
+    case TypeCode::UInt16: *partSize = 2; return 1;
+    case TypeCode::Int32:
+    case TypeCode::UInt32:
+    case TypeCode::Float32: *partSize = 4; return 1;
+    case TypeCode::Int64:
+    case TypeCode::UInt64:
+    case TypeCode::Float64: *partSize = 8; return 1;
+    case TypeCode::Complex64: *partSize = 4; return 2;
+    case TypeCode::Complex128: *partSize = 8; return 2;
+    default: return 0;
+  }
+}
+
+void PutPart(uint8_t* into, const uint8_t* from, uint8_t size, bool swap) {
+  switch (size) {
+    case 1: *into = *from; return;
+    case 2: {
+      uint16_t v;
+      std::memcpy(&v, from, 2);
+      if (swap) v = static_cast<uint16_t>((v >> 8) | (v << 8));
+      std::memcpy(into, &v, 2);
+      return;
+    }
+    case 4: {
+      uint32_t v;
+      std::memcpy(&v, from, 4);
+      if (swap) v = __builtin_bswap32(v);
+      std::memcpy(into, &v, 4);
+      return;
+    }
+    default: {
+      uint64_t v;
+      std::memcpy(&v, from, 8);
+      if (swap) v = __builtin_bswap64(v);
+      std::memcpy(into, &v, 8);
+      return;
+    }
+  }
+}
+
+int32_t StringLength(const uint8_t* slot) {
+  const auto h = Load<LStrHandle>(slot);
+  return h != nullptr ? std::max((*h)->cnt, 0) : 0;
+}
+
+}  // namespace
+
+int32_t TDClusterImp::RecordFlatPlan() {
+  flatFixedBytes_ = -1;
+  flatSteps_.clear();
+  int32_t fixed = 0;
+  bool plain = true;
+  try {
+    ForEachElt([&](const TDImp& element, int64_t offset) {
+      uint8_t size = 0;
+      const int32_t parts = PlainNumberParts(element, &size);
+      for (int32_t p = 0; p < parts; ++p) {
+        flatSteps_.push_back(FlatStep{static_cast<int32_t>(offset + p * size), size});
+        fixed += size;
+      }
+      if (parts != 0) return 0;
+      const auto* text = dynamic_cast<const TDStringImp*>(&element);
+      if (text != nullptr && vellum::bound::IsVariable(text->GetBound())) {
+        flatSteps_.push_back(FlatStep{static_cast<int32_t>(offset), 0});
+        fixed += 4;
+        return 0;
+      }
+      plain = false;
+      return 1;
+    });
+  } catch (const std::bad_alloc&) {
+    flatSteps_.clear();
+    return kStatusOutOfMemory;
+  }
+  if (!plain || GetNumElts() == 0) {
+    flatSteps_.clear();
+    return kStatusNoError;
+  }
+  flatFixedBytes_ = fixed;
+  return kStatusNoError;
+}
+
+uint64_t TDClusterImp::PlannedFlatSize(const uint8_t* value) const {
+  uint64_t size = static_cast<uint64_t>(flatFixedBytes_);
+  if (value == nullptr) return size;
+  for (const FlatStep& step : flatSteps_)
+    if (step.size == 0) size += static_cast<uint64_t>(StringLength(value + step.offset));
+  return size;
+}
+
+int32_t TDClusterImp::WriteWithPlan(KoDataWriter* writer, const void* data, int32_t count) const {
+  const int64_t stride = DataSizeCore(nullptr);
+  const auto* values = static_cast<const uint8_t*>(data);
+  uint64_t total = 0;
+  for (int32_t v = 0; v < count; ++v) total += PlannedFlatSize(values + stride * v);
+  uint8_t* out = writer->ReserveBytes(static_cast<size_t>(total));
+  if (out == nullptr) return writer->GetError();
+  const bool swap = writer->GetEndianizer()->Swaps();
+  for (int32_t v = 0; v < count; ++v) {
+    const uint8_t* value = values + stride * v;
+    for (const FlatStep& step : flatSteps_) {
+      if (step.size != 0) {
+        PutPart(out, value + step.offset, step.size, swap);
+        out += step.size;
+        continue;
+      }
+      const auto h = Load<LStrHandle>(value + step.offset);
+      const int32_t length = h != nullptr ? std::max((*h)->cnt, 0) : 0;
+      const uint32_t word = static_cast<uint32_t>(length);
+      PutPart(out, reinterpret_cast<const uint8_t*>(&word), 4, swap);
+      if (length != 0) std::memcpy(out + 4, (*h)->str, static_cast<size_t>(length));
+      out += 4 + length;
+    }
+  }
+  return writer->GetError();
+}
+
+int32_t TDClusterImp::ReadWithPlan(KoDataReader* reader, void* data, int32_t count) const {
+  const int64_t stride = DataSizeCore(nullptr);
+  auto* values = static_cast<uint8_t*>(data);
+  const bool swap = reader->GetEndianizer()->Swaps();
+  for (int32_t v = 0; v < count && reader->GetError() == kStatusNoError; ++v) {
+    uint8_t* value = values + stride * v;
+    for (const FlatStep& step : flatSteps_) {
+      if (step.size == 0) {
+        auto h = Load<LStrHandle>(value + step.offset);
+        const int32_t status = ReadLStrValue(reader, vellum::bound::kVariable, &h);
+        Store(value + step.offset, h);
+        if (status != kStatusNoError) return status;
+        continue;
+      }
+      const uint8_t* in = reader->TakeBytes(step.size);
+      if (in == nullptr) {
+        std::memset(value + step.offset, 0, step.size);
+        return reader->GetError();
+      }
+      PutPart(value + step.offset, in, step.size, swap);
+    }
+  }
+  return reader->GetError();
 }

@@ -97,13 +97,24 @@ class TDClusterImp : public TDMultiContainerImp {
   // first other status.
   template <class Step>
   int32_t ForEachDataStep(Step step) const;
-  // Calls `visit(element, offset)` for each present element, in order, while it returns true.
-  template <class Visit>
-  void ForEachElement(Visit visit) const;
+  // The flattened form of an interned cluster made only of plain numbers and variable strings,
+  // recorded with its layout: values are then written and read in one pass, with no call per
+  // element. A number of several parts (complex) takes one step per part.
+  struct FlatStep {
+    int32_t offset;
+    uint8_t size;  // bytes of a number part; 0 for a variable string
+  };
+  bool HasFlatPlan() const { return flatFixedBytes_ >= 0 && HasRecordedLayout(); }
+  int32_t RecordFlatPlan();
+  uint64_t PlannedFlatSize(const uint8_t* value) const;
+  int32_t WriteWithPlan(KoDataWriter* writer, const void* data, int32_t count) const;
+  int32_t ReadWithPlan(KoDataReader* reader, void* data, int32_t count) const;
 
   // The layout of an interned cluster for the running process, made at check-in with the
   // SetDSAlign value then in force (-1: none); used only while that value holds.
   int32_t layoutDSAlign_ = -1;
+  std::vector<FlatStep, PXAllocator<FlatStep>> flatSteps_;
+  int32_t flatFixedBytes_ = -1;  // the number parts' bytes per value; -1: no plan
   std::vector<int32_t, PXAllocator<int32_t>> offsets_;
   std::vector<DataStep, PXAllocator<DataStep>> steps_;
   // The whole datum's size when no element holds handles (copied as one block); -1 otherwise.

@@ -41,18 +41,6 @@ constexpr int32_t kRecordElements = 3;
 const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 
 // Data may sit at any offset of a packed cluster: handles and records are moved bytewise.
-template <class T>
-T Load(const void* data) {
-  T value;
-  std::memcpy(&value, data, sizeof value);
-  return value;
-}
-
-template <class T>
-void Store(void* data, T value) {
-  std::memcpy(data, &value, sizeof value);
-}
-
 UHandle AsUHandle(LStrHandle h) { return reinterpret_cast<UHandle>(h); }
 int32_t LengthWord(LStrHandle h) { return (*h)->cnt; }
 void SetLengthWord(LStrHandle h, int32_t length) { (*h)->cnt = length; }
@@ -762,8 +750,9 @@ namespace {
 
 LStrHandle LoadHandle(const void* slot) { return Load<LStrHandle>(slot); }
 
-// One string value into *slot (null: skip it). 0, or the stream's status.
-int32_t ReadOneLStr(KoDataReader* reader, int32_t bound, LStrHandle* slot) {
+}  // namespace
+
+int32_t ReadLStrValue(KoDataReader* reader, int32_t bound, LStrHandle* slot) {
   int32_t length = 0;
   if (reader->ReadI32(&length) != kStatusNoError) return reader->GetError();
   // The bytes must be in the input before anything is allocated for them.
@@ -806,7 +795,6 @@ int32_t ReadOneLStr(KoDataReader* reader, int32_t bound, LStrHandle* slot) {
   return reader->GetError();
 }
 
-}  // namespace
 
 uint32_t TDStringBaseImp::FlatDataSize(KoDataWriter*, const void* data) const {
   if (data == nullptr) return 4 + static_cast<uint32_t>(vellum::bound::IsFixed(bound_) ? vellum::bound::Length(bound_) : 0);
@@ -829,12 +817,12 @@ int32_t TDStringBaseImp::ReadData(KoDataReader* reader, void* data, int32_t coun
   auto* slots = static_cast<uint8_t*>(data);
   for (int32_t i = 0; i < count && reader->GetError() == kStatusNoError; ++i) {
     if (slots == nullptr) {
-      ReadOneLStr(reader, bound_, nullptr);
+      ReadLStrValue(reader, bound_, nullptr);
       continue;
     }
     uint8_t* slot = slots + static_cast<size_t>(i) * sizeof(LStrHandle);
     LStrHandle h = LoadHandle(slot);
-    ReadOneLStr(reader, bound_, &h);
+    ReadLStrValue(reader, bound_, &h);
     Store(slot, h);
   }
   if (status != nullptr) *status = reader->GetError();

@@ -167,6 +167,10 @@ class TDPictImp final : public TDStringBaseImp {
   const char* KindText() const override { return "picture"; }
 };
 
+// One string value of flattened data into *slot (null: skip it), sized for the bound word as a
+// string of that bound reads it. 0, or the stream's status.
+int32_t ReadLStrValue(KoDataReader* reader, int32_t bound, LStrHandle* slot);
+
 // The bound word of a string-base descriptor; -1 for any other kind or null.
 int32_t BoundOfStringBase(const TDImp* type);
 

@@ -13,6 +13,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXPath.h"
 #include "runtime/PXStrings.h"
+#include "source/MoveBytes.h"
 #include "source/TDArray.h"
 #include "source/TDBlock.h"
 #include "source/TDCluster.h"
@@ -74,13 +75,6 @@ class CompareTable {
 CompareTable& TheCompareTable() {
   static CompareTable table;
   return table;
-}
-
-template <class T>
-T Load(const void* data) {
-  T value;
-  std::memcpy(&value, data, sizeof value);
-  return value;
 }
 
 const uint8_t* At(const void* data, int64_t offset) { return static_cast<const uint8_t*>(data) + offset; }
