@@ -13,10 +13,15 @@
 
 #include <CLI/CLI.hpp>
 
+#include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
 #include "runtime/DebugStream.h"
 #include "runtime/KoExcept.h"
 #include "runtime/PXApp.h"
+#include "source/KoDataReader.h"
+#include "source/KoDataWriter.h"
+#include "tools/HexText.h"
+#include "tools/JsonView.h"
 #include "vellum.h"
 
 namespace {
@@ -25,8 +30,12 @@ namespace {
 constexpr int kExitFailure = 1;
 constexpr int kExitUsage = 2;
 
-// Type strings in daily use are a few kilobytes; the cap keeps a runaway pipe from filling memory.
+// Type strings in daily use are a few kilobytes, and data rarely more than megabytes; the cap keeps a
+// runaway pipe from filling memory.
 constexpr size_t kMaxInputBytes = size_t{64} << 20;
+// The default datum a data command makes, blocks included; a type that needs more is refused before
+// any memory is taken for it (a fixed-size array can ask for gigabytes).
+constexpr uint64_t kMaxDatumBytes = uint64_t{64} << 20;
 
 // Starts the library the way a host does, and stops it when the command is done.
 class LibrarySession {
@@ -115,48 +124,6 @@ class OwnedHandle {
   UHandle handle_ = nullptr;
 };
 
-std::string LowerHex(const uint8_t* data, size_t size) {
-  static constexpr char kDigits[] = "0123456789abcdef";
-  std::string text;
-  text.reserve(2 * size);
-  for (size_t i = 0; i < size; ++i) {
-    text += kDigits[data[i] >> 4];
-    text += kDigits[data[i] & 0x0F];
-  }
-  return text;
-}
-
-int HexDigit(char c) {
-  if (c >= '0' && c <= '9') return c - '0';
-  if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-  if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-  return -1;
-}
-
-// Two hex digits per byte in either case; blanks may stand anywhere between them. "" on success,
-// otherwise what is wrong with the text.
-std::string ParseHex(const std::string& text, std::vector<uint8_t>* bytes) {
-  int high = -1;
-  for (size_t i = 0; i < text.size(); ++i) {
-    const char c = text[i];
-    if (c == ' ' || c == '\t' || c == '\n' || c == '\r') continue;
-    const int digit = HexDigit(c);
-    if (digit < 0) {
-      char shown[16];
-      std::snprintf(shown, sizeof shown, c > ' ' && c < 0x7F ? "'%c'" : "byte 0x%02x", static_cast<unsigned char>(c));
-      return std::string(shown) + " at offset " + std::to_string(i) + " is not a hex digit";
-    }
-    if (high < 0) {
-      high = digit;
-    } else {
-      bytes->push_back(static_cast<uint8_t>(high << 4 | digit));
-      high = -1;
-    }
-  }
-  if (high >= 0) return "an odd number of hex digits";
-  return std::string();
-}
-
 // Reads all of `file` (opened by the caller) up to the cap. "" on success, otherwise the reason.
 std::string ReadAll(std::FILE* file, std::vector<uint8_t>* bytes) {
   uint8_t chunk[65536];
@@ -176,7 +143,7 @@ std::string CheckVersionWord(const std::string& text) {
   const size_t start = text.rfind("0x", 0) == 0 || text.rfind("0X", 0) == 0 ? 2 : 0;
   const size_t digits = text.size() - start;
   bool valid = digits >= 1 && digits <= 8;
-  for (size_t i = start; valid && i < text.size(); ++i) valid = HexDigit(text[i]) >= 0;
+  for (size_t i = start; valid && i < text.size(); ++i) valid = HexDigitValue(text[i]) >= 0;
   return valid ? std::string() : "'" + text + "' is not a 32-bit version word in hex, such as 0x22308000";
 }
 
@@ -269,32 +236,40 @@ int EncodeTypes(const std::vector<std::string>& texts, uint32_t version, Diagnos
   return 0;
 }
 
+// Whether a command-line word names a file ("@FILE") or standard input ("-") to read instead.
+bool NamesInput(const std::string& word) { return word == "-" || (!word.empty() && word[0] == '@'); }
+
+// The raw bytes of the file or standard input that `word` names (see NamesInput).
+int ReadNamedInput(const std::string& word, std::vector<uint8_t>* bytes) {
+  const bool fromStdin = word == "-";
+  const std::string path = word.substr(1);
+  const std::string shown = fromStdin ? std::string("standard input") : "'" + path + "'";
+  std::FILE* file = fromStdin ? stdin : std::fopen(path.c_str(), "rb");
+  if (file == nullptr) return Fail(kExitFailure, "cannot open " + shown + ": " + std::strerror(errno));
+  const std::string problem = ReadAll(file, bytes);
+  if (!fromStdin) std::fclose(file);
+  if (!problem.empty()) return Fail(kExitFailure, "cannot read " + shown + ": " + problem);
+  return 0;
+}
+
 // The bytes named on the command line: hex text, "@FILE" for a file's raw bytes, or "-" for raw
-// bytes on standard input.
-int ReadTypeString(const std::vector<std::string>& words, std::vector<uint8_t>* bytes) {
+// bytes on standard input. `label` names the argument in messages.
+int ReadBytesArgument(const std::vector<std::string>& words, const std::string& label, std::vector<uint8_t>* bytes) {
   const std::string& first = words.front();
-  if (first == "-" || (!first.empty() && first[0] == '@')) {
-    if (words.size() > 1) return Fail(kExitUsage, "'" + first + "' must be the only BYTES argument (try --help)");
-    const bool fromStdin = first == "-";
-    const std::string path = first.substr(1);
-    const std::string shown = fromStdin ? std::string("standard input") : "'" + path + "'";
-    std::FILE* file = fromStdin ? stdin : std::fopen(path.c_str(), "rb");
-    if (file == nullptr) return Fail(kExitFailure, "cannot open " + shown + ": " + std::strerror(errno));
-    const std::string problem = ReadAll(file, bytes);
-    if (!fromStdin) std::fclose(file);
-    if (!problem.empty()) return Fail(kExitFailure, "cannot read " + shown + ": " + problem);
-    return 0;
+  if (NamesInput(first)) {
+    if (words.size() > 1) return Fail(kExitUsage, "'" + first + "' must be the only " + label + " argument (try --help)");
+    return ReadNamedInput(first, bytes);
   }
   std::string text;
   for (const std::string& word : words) text += word + ' ';
   if (const std::string problem = ParseHex(text, bytes); !problem.empty())
-    return Fail(kExitUsage, "BYTES: " + problem + " (try --help)");
+    return Fail(kExitUsage, label + ": " + problem + " (try --help)");
   return 0;
 }
 
 int DecodeTypes(const std::vector<std::string>& words, uint32_t version, bool dump, DiagnosticCapture& diagnostics) {
   std::vector<uint8_t> bytes;
-  if (const int exitStatus = ReadTypeString(words, &bytes); exitStatus != 0) return exitStatus;
+  if (const int exitStatus = ReadBytesArgument(words, "BYTES", &bytes); exitStatus != 0) return exitStatus;
   const PersistTDData persist(version);
   TMTypeList list;
   const int32_t status = UnFlattenListOfTypes(&persist, bytes.data(), static_cast<uint32_t>(bytes.size()), &list,
@@ -315,6 +290,118 @@ int DecodeTypes(const std::vector<std::string>& words, uint32_t version, bool du
       }
     }
   }
+  return 0;
+}
+
+// --- vellum data ------------------------------------------------------------------------------------
+
+// Whether the data commands can hold and show values of `type`; false after the error line.
+bool CheckDataType(const TDR& type, int* exitStatus) {
+  if (const std::string refusal = JsonViewRefusal(type); !refusal.empty()) {
+    *exitStatus = Fail(kExitFailure, "cannot show values of this type: " + refusal);
+    return false;
+  }
+  if (const uint64_t bytes = DefaultDataBytes(type); bytes > kMaxDatumBytes) {
+    *exitStatus = Fail(kExitFailure, "a value of this type takes " +
+                                         (bytes >> 40 != 0 ? std::string("over 2^40") : std::to_string(bytes)) +
+                                         " bytes in memory, more than the tool holds (" +
+                                         std::to_string(kMaxDatumBytes) + ")");
+    return false;
+  }
+  return true;
+}
+
+// The JSON value on the command line: the text itself, "@FILE" for a file holding it, or "-" for
+// standard input.
+int ReadJsonArgument(const std::string& word, JsonValue* value) {
+  std::string text = word;
+  if (NamesInput(word)) {
+    std::vector<uint8_t> bytes;
+    if (const int exitStatus = ReadNamedInput(word, &bytes); exitStatus != 0) return exitStatus;
+    text.assign(bytes.begin(), bytes.end());
+  }
+  try {
+    *value = JsonValue::parse(text);
+  } catch (const JsonValue::parse_error& e) {
+    // The library's "[json.exception.parse_error.101] " prefix says nothing to a reader.
+    std::string reason = e.what();
+    if (const size_t end = reason.find("] "); reason.rfind("[json.exception.", 0) == 0 && end != std::string::npos)
+      reason.erase(0, end + 2);
+    return Fail(kExitFailure, "cannot parse the JSON value: " + reason);
+  }
+  return 0;
+}
+
+int EncodeData(const std::string& text, const std::string& json, uint32_t version, DiagnosticCapture& diagnostics) {
+  TDR type;
+  if (int exitStatus = 0; !ParseNotation(text, &type, &exitStatus) || !CheckDataType(type, &exitStatus))
+    return exitStatus;
+  JsonValue value;
+  if (const int exitStatus = ReadJsonArgument(json, &value); exitStatus != 0) return exitStatus;
+  OwnedDatum datum(type);
+  if (datum.Status() != 0) return FailWithStatus("cannot make a value of the type", datum.Status(), diagnostics.Take());
+  try {
+    JsonToData(type, value, datum.Data());
+  } catch (const JsonViewError& e) {
+    return Fail(kExitFailure, std::string("the JSON value does not fit the type: ") + e.what());
+  }
+  OutputBuf out;
+  KoDataWriter writer(&out, version, nullptr, 0);
+  if (const int32_t status = writer.WriteData(type, datum.Data(), 1); status != 0)
+    return FailWithStatus("cannot flatten the value", status, diagnostics.Take());
+  std::printf("%s\n", LowerHex(out.Data(), out.GetBytesWritten()).c_str());
+  PrintWarnings(diagnostics.Take());
+  return 0;
+}
+
+// The type of a data command: the notation, or the one entry of a type string.
+int DataType(const std::string* text, const std::string* typeString, uint32_t version, TDR* type,
+             DiagnosticCapture& diagnostics) {
+  if (text != nullptr) {
+    int exitStatus = 0;
+    return ParseNotation(*text, type, &exitStatus) ? 0 : exitStatus;
+  }
+  std::vector<uint8_t> bytes;
+  if (const int exitStatus = ReadBytesArgument({*typeString}, "TYPEBYTES", &bytes); exitStatus != 0) return exitStatus;
+  const PersistTDData persist(version);
+  const int32_t status = UnFlattenOneType(&persist, bytes.data(), static_cast<uint32_t>(bytes.size()), type, nullptr);
+  if (status != 0) return FailWithStatus("cannot decode the type string", status, diagnostics.Take());
+  return 0;
+}
+
+// `words` are TEXT and then BYTES, or BYTES alone when the type comes from `typeString`.
+int DecodeData(const std::vector<std::string>& words, const std::string* typeString, uint32_t version, bool named,
+               DiagnosticCapture& diagnostics) {
+  const std::vector<std::string> byteWords(words.begin() + (typeString != nullptr ? 0 : 1), words.end());
+  if (byteWords.empty()) return Fail(kExitUsage, "BYTES is required (try --help)");
+  if (typeString != nullptr && *typeString == "-" && byteWords.front() == "-")
+    return Fail(kExitUsage, "standard input can give TYPEBYTES or BYTES, not both (try --help)");
+  TDR type;
+  if (const int exitStatus = DataType(typeString != nullptr ? nullptr : &words.front(), typeString, version, &type,
+                                      diagnostics);
+      exitStatus != 0)
+    return exitStatus;
+  if (int exitStatus = 0; !CheckDataType(type, &exitStatus)) return exitStatus;
+  std::vector<uint8_t> bytes;
+  if (const int exitStatus = ReadBytesArgument(byteWords, "BYTES", &bytes); exitStatus != 0) return exitStatus;
+  OwnedDatum datum(type);
+  if (datum.Status() != 0) return FailWithStatus("cannot make a value of the type", datum.Status(), diagnostics.Take());
+  InputBuf in(bytes.data(), bytes.size());
+  KoDataReader reader(&in, version, nullptr, nullptr, 0);
+  if (const int32_t status = reader.ReadData(type, datum.Data(), 1); status != 0)
+    return FailWithStatus("cannot read the data", status, diagnostics.Take());
+  if (reader.BytesLeft() != 0) {
+    return Fail(kExitFailure, std::to_string(reader.BytesLeft()) + " byte(s) follow the value, which ends at byte " +
+                                  std::to_string(in.Position()));
+  }
+  JsonValue value;
+  try {
+    value = DataToJson(type, datum.Data(), named);
+  } catch (const JsonViewError& e) {
+    return Fail(kExitFailure, std::string("cannot show the value: ") + e.what());
+  }
+  std::printf("%s\n", value.dump().c_str());
+  PrintWarnings(diagnostics.Take());
   return 0;
 }
 
@@ -353,7 +440,7 @@ std::vector<std::string> Words(const CLI::App& command, const std::string& first
 int main(int argc, char** argv) {
   CLI::App app{
       "vellum: the run-time type system's own tool.\n"
-      "It shows the table of type codes, and decodes and encodes stored type strings and data."};
+      "It shows the table of type codes, decodes and encodes stored type strings, and shows flattened data as JSON."};
   // One line for a malformed command line, as for every other failure.
   app.failure_message([](const CLI::App*, const CLI::Error& e) {
     return std::string("vellum: ") + e.what() + " (try --help)\n";
@@ -402,12 +489,53 @@ int main(int argc, char** argv) {
       ->check(versionWord);
   decode->add_flag("--dump", dump, "Print each entry's descriptor dump after its line");
 
+  CLI::App* data = app.add_subcommand("data", "Encode and decode flattened data, the values shown as JSON");
+  data->require_subcommand(1);
+  CLI::App* dataEncode = data->add_subcommand(
+      "encode",
+      "Print, in lowercase hex, the flattened data of a value of the type given in the textual notation; "
+      "the value is written as JSON (the README's JSON view)");
+  std::string dataEncodeText;
+  std::string dataEncodeJson;
+  std::string dataEncodeVersion;
+  dataEncode->add_option("TEXT", dataEncodeText, "The type in the textual notation")->required();
+  dataEncode->add_option("JSON", dataEncodeJson, "The value as JSON, @FILE for a file holding it, or - for standard input")
+      ->required();
+  dataEncode->add_option("--version", dataEncodeVersion, "The version word to write, in hex (default: the running version)")
+      ->check(versionWord);
+
+  CLI::App* dataDecode = data->add_subcommand(
+      "decode",
+      "Read the flattened data of one value and print the value as JSON on one line; bytes left after the value "
+      "are an error. The type is TEXT in the textual notation, or with --typestring the one entry of a type string");
+  std::string dataDecodeFirst;
+  std::string dataDecodeVersion;
+  std::string dataTypeString;
+  bool named = false;
+  dataDecode
+      ->add_option("TEXT", dataDecodeFirst,
+                   "The type in the textual notation, then BYTES: the data in hex (either case, blanks allowed, also "
+                   "over several words), @FILE for a file's raw bytes, or - for raw bytes on standard input. With "
+                   "--typestring, BYTES alone")
+      ->required();
+  dataDecode->allow_extras();
+  CLI::Option* typeStringOption = dataDecode->add_option(
+      "--typestring", dataTypeString,
+      "Take the type from this type string instead: hex (one word), @FILE for a file's raw bytes, or - for standard input")
+      ->type_name("TYPEBYTES");
+  dataDecode->add_option("--version", dataDecodeVersion, "The version word to read, in hex (default: the running version)")
+      ->check(versionWord);
+  dataDecode->add_flag("--named", named,
+                       "Show a cluster whose elements all have distinct, non-empty names as an object keyed by name");
+
   std::vector<std::string> encodeTexts;
   std::vector<std::string> decodeWords;
+  std::vector<std::string> dataDecodeWords;
   try {
     app.parse(argc, argv);
     if (encode->parsed()) encodeTexts = Words(*encode, encodeFirst);
     if (decode->parsed()) decodeWords = Words(*decode, decodeFirst);
+    if (dataDecode->parsed()) dataDecodeWords = Words(*dataDecode, dataDecodeFirst);
   } catch (const CLI::ParseError& e) {
     return app.exit(e) == 0 ? 0 : kExitUsage;
   }
@@ -425,6 +553,11 @@ int main(int argc, char** argv) {
     }
     if (encode->parsed()) return EncodeTypes(encodeTexts, VersionWord(encodeVersion), diagnostics);
     if (decode->parsed()) return DecodeTypes(decodeWords, VersionWord(decodeVersion), dump, diagnostics);
+    if (dataEncode->parsed()) return EncodeData(dataEncodeText, dataEncodeJson, VersionWord(dataEncodeVersion), diagnostics);
+    if (dataDecode->parsed()) {
+      return DecodeData(dataDecodeWords, typeStringOption->count() > 0 ? &dataTypeString : nullptr,
+                        VersionWord(dataDecodeVersion), named, diagnostics);
+    }
     return kExitUsage;
   } catch (const KoExcept& e) {
     return Fail(kExitFailure, "the library failed (status " + std::to_string(e.Status()) + "): " + e.Message());
