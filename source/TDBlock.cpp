@@ -243,29 +243,48 @@ int32_t TDBlockContainerImp::ConvertBytes(const TDImp* dst, const void* src, voi
   return kStatusNoError;
 }
 
-// --- TDTypeBlockImp --------------------------------------------------------------------------------
+// --- TDStoredAlignmentBlockImp -----------------------------------------------------------------------
 
-TDImpPtr TDTypeBlockImp::NewInstance() const { return MakeCounted<TDTypeBlockImp>(); }
-
-int32_t TDTypeBlockImp::ComputeHashValue() const {
+int32_t TDStoredAlignmentBlockImp::ComputeHashValue() const {
   return static_cast<int32_t>(static_cast<uint32_t>(TDBlockContainerImp::ComputeHashValue()) + alignment_);
 }
 
-int32_t TDTypeBlockImp::IsSameAs(const TDImp& other) const {
+int32_t TDStoredAlignmentBlockImp::IsSameAs(const TDImp& other) const {
   if (this == &other) return 1;
-  if (TDBlockContainerImp::IsSameAs(other) == 0 || other.IsTypeBlock() == 0) return 0;
-  return static_cast<const TDTypeBlockImp&>(other).alignment_ == alignment_ ? 1 : 0;
+  if (TDBlockContainerImp::IsSameAs(other) == 0 || other.GetTypeCode() != GetTypeCode()) return 0;
+  return static_cast<const TDStoredAlignmentBlockImp&>(other).alignment_ == alignment_ ? 1 : 0;
 }
 
-int32_t TDTypeBlockImp::MemberCloneOrCheckOut(TDImpPtr& target) const {
-  static_cast<TDTypeBlockImp&>(*target).alignment_ = alignment_;
+int32_t TDStoredAlignmentBlockImp::MemberCloneOrCheckOut(TDImpPtr& target) const {
+  static_cast<TDStoredAlignmentBlockImp&>(*target).alignment_ = alignment_;
   return TDBlockContainerImp::MemberCloneOrCheckOut(target);
 }
 
-int32_t TDTypeBlockImp::MemberCheckIn(TDImpPtr& target) const {
-  static_cast<TDTypeBlockImp&>(*target).alignment_ = alignment_;
+int32_t TDStoredAlignmentBlockImp::MemberCheckIn(TDImpPtr& target) const {
+  static_cast<TDStoredAlignmentBlockImp&>(*target).alignment_ = alignment_;
   return TDBlockContainerImp::MemberCheckIn(target);
 }
+
+int32_t TDStoredAlignmentBlockImp::CompareForSorting(const TDImp* other) const {
+  const int32_t byElement = TDBlockContainerImp::CompareForSorting(other);
+  if (byElement != 0 || other == nullptr || other->GetTypeCode() != GetTypeCode()) return byElement;
+  return Order(alignment_, static_cast<const TDStoredAlignmentBlockImp*>(other)->alignment_);
+}
+
+void TDStoredAlignmentBlockImp::SetAlignmentValue(uint16_t alignment) {
+  alignment_ = alignment;
+  ClearHashValid();
+}
+
+void TDStoredAlignmentBlockImp::PrintBlock(const uint8_t* prefix, const char* kind) const {
+  Report(prefix, kind);
+  (VELLUM_DEBUG(0) << PrefixText(prefix) << "alignment = " << alignment_).Process();
+  TDBlockContainerImp::PrintDebugStr(prefix);
+}
+
+// --- TDTypeBlockImp --------------------------------------------------------------------------------
+
+TDImpPtr TDTypeBlockImp::NewInstance() const { return MakeCounted<TDTypeBlockImp>(); }
 
 int32_t TDTypeBlockImp::DataSizeCore(ITargetPlatformAlignment* platform) const {
   return GetElt() ? GetElt()->DataSizeCore(platform) : 0;
@@ -273,11 +292,12 @@ int32_t TDTypeBlockImp::DataSizeCore(ITargetPlatformAlignment* platform) const {
 
 int32_t TDTypeBlockImp::GetAlignment(ITargetPlatformAlignment* platform) const {
   const int32_t own = GetElt() ? GetElt()->GetAlignment(platform) : 1;
-  if (alignment_ == 0) return own;
-  if (alignment_ != own) {
-    (VELLUM_DEBUG(3) << "TypeBlock alignment " << alignment_ << " differs from its element's " << own).Process();
+  const int32_t stored = GetStoredAlignment();
+  if (stored == 0) return own;
+  if (stored != own) {
+    (VELLUM_DEBUG(3) << "TypeBlock alignment " << stored << " differs from its element's " << own).Process();
   }
-  return alignment_;
+  return stored;
 }
 
 int32_t TDTypeBlockImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {
@@ -294,62 +314,17 @@ int32_t TDTypeBlockImp::CmpTD(const TDImp* source, int32_t flags, int32_t) const
   return CompareElements(*this, source, flags);
 }
 
-int32_t TDTypeBlockImp::CompareForSorting(const TDImp* other) const {
-  const int32_t byElement = TDBlockContainerImp::CompareForSorting(other);
-  if (byElement != 0 || other == nullptr || other->IsTypeBlock() == 0) return byElement;
-  return Order(alignment_, static_cast<const TDTypeBlockImp*>(other)->alignment_);
-}
-
-void TDTypeBlockImp::PrintDebugStr(const uint8_t* prefix) const {
-  Report(prefix, "type = type block");
-  (VELLUM_DEBUG(0) << PrefixText(prefix) << "alignment = " << alignment_).Process();
-  TDBlockContainerImp::PrintDebugStr(prefix);
-}
+void TDTypeBlockImp::PrintDebugStr(const uint8_t* prefix) const { PrintBlock(prefix, "type = type block"); }
 
 // --- TDVoidBlockImp --------------------------------------------------------------------------------
 
 TDImpPtr TDVoidBlockImp::NewInstance() const { return MakeCounted<TDVoidBlockImp>(); }
 
-int32_t TDVoidBlockImp::ComputeHashValue() const {
-  return static_cast<int32_t>(static_cast<uint32_t>(TDBlockContainerImp::ComputeHashValue()) + alignment_);
-}
-
-int32_t TDVoidBlockImp::IsSameAs(const TDImp& other) const {
-  if (this == &other) return 1;
-  if (TDBlockContainerImp::IsSameAs(other) == 0 || other.IsVoidBlock() == 0) return 0;
-  return static_cast<const TDVoidBlockImp&>(other).alignment_ == alignment_ ? 1 : 0;
-}
-
-int32_t TDVoidBlockImp::MemberCloneOrCheckOut(TDImpPtr& target) const {
-  static_cast<TDVoidBlockImp&>(*target).alignment_ = alignment_;
-  return TDBlockContainerImp::MemberCloneOrCheckOut(target);
-}
-
-int32_t TDVoidBlockImp::MemberCheckIn(TDImpPtr& target) const {
-  static_cast<TDVoidBlockImp&>(*target).alignment_ = alignment_;
-  return TDBlockContainerImp::MemberCheckIn(target);
-}
-
 int32_t TDVoidBlockImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t) const {
   return ConvertBytes(dst, src, dstData);
 }
 
-int32_t TDVoidBlockImp::CompareForSorting(const TDImp* other) const {
-  const int32_t byElement = TDBlockContainerImp::CompareForSorting(other);
-  if (byElement != 0 || other == nullptr || other->IsVoidBlock() == 0) return byElement;
-  return Order(alignment_, static_cast<const TDVoidBlockImp*>(other)->alignment_);
-}
-
-void TDVoidBlockImp::PrintDebugStr(const uint8_t* prefix) const {
-  Report(prefix, "type = void block");
-  (VELLUM_DEBUG(0) << PrefixText(prefix) << "alignment = " << alignment_).Process();
-  TDBlockContainerImp::PrintDebugStr(prefix);
-}
-
-void TDVoidBlockImp::SetStoredAlignment(uint16_t alignment) {
-  alignment_ = alignment;
-  ClearHashValid();
-}
+void TDVoidBlockImp::PrintDebugStr(const uint8_t* prefix) const { PrintBlock(prefix, "type = void block"); }
 
 // --- TDRepeatedBlockImp ----------------------------------------------------------------------------
 

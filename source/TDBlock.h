@@ -91,60 +91,66 @@ class TDBlockContainerImp : public TDSingleContainerImp {
   int32_t ConvertBytes(const TDImp* dst, const void* src, void* dstData) const;
 };
 
-// Bytes laid out as the element type: its size, and the stored alignment (the element's own when
-// none was stored).
-class TDTypeBlockImp final : public TDBlockContainerImp {
+// Element blocks with a stored alignment (type and void blocks): the alignment takes part in
+// hash, equality, copies and order.
+class TDStoredAlignmentBlockImp : public TDBlockContainerImp {
  public:
-  TDTypeBlockImp() noexcept = default;
-  TDTypeBlockImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink) noexcept
-      : TDBlockContainerImp(name, typedefLink) {}
-  int16_t GetTypeCode() const override { return static_cast<int16_t>(TypeCode::TypeBlock); }
-  TDImpPtr NewInstance() const override;
   int32_t ComputeHashValue() const override;
   int32_t IsSameAs(const TDImp& other) const override;
   int32_t MemberCloneOrCheckOut(TDImpPtr& target) const override;
   int32_t MemberCheckIn(TDImpPtr& target) const override;
+  // By element, then by alignment.
+  int32_t CompareForSorting(const TDImp* other) const override;
+
+  uint16_t GetStoredAlignment() const noexcept { return alignment_; }
+
+ protected:
+  explicit TDStoredAlignmentBlockImp(uint16_t alignment) noexcept : alignment_(alignment) {}
+  TDStoredAlignmentBlockImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink, uint16_t alignment) noexcept
+      : TDBlockContainerImp(name, typedefLink), alignment_(alignment) {}
+  void SetAlignmentValue(uint16_t alignment);
+  // The kind line and the alignment line of the dump, then the element.
+  void PrintBlock(const uint8_t* prefix, const char* kind) const;
+
+ private:
+  uint16_t alignment_;
+};
+
+// Bytes laid out as the element type: its size, and the stored alignment (the element's own when
+// none was stored).
+class TDTypeBlockImp final : public TDStoredAlignmentBlockImp {
+ public:
+  TDTypeBlockImp() noexcept : TDStoredAlignmentBlockImp(0) {}
+  TDTypeBlockImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink) noexcept
+      : TDStoredAlignmentBlockImp(name, typedefLink, 0) {}
+  int16_t GetTypeCode() const override { return static_cast<int16_t>(TypeCode::TypeBlock); }
+  TDImpPtr NewInstance() const override;
   int32_t DataSizeCore(ITargetPlatformAlignment* platform) const override;
   // A stored alignment other than the element's is reported and still used.
   int32_t GetAlignment(ITargetPlatformAlignment* platform) const override;
   int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;
   int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
   int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const override;
-  int32_t CompareForSorting(const TDImp* other) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t IsTypeBlock() const override { return 1; }
-
-  uint16_t GetStoredAlignment() const noexcept { return alignment_; }
-
- private:
-  uint16_t alignment_ = 0;
 };
 
 // No bytes; only an alignment.
-class TDVoidBlockImp final : public TDBlockContainerImp {
+class TDVoidBlockImp final : public TDStoredAlignmentBlockImp {
  public:
-  TDVoidBlockImp() noexcept = default;
+  TDVoidBlockImp() noexcept : TDStoredAlignmentBlockImp(1) {}
   TDVoidBlockImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink) noexcept
-      : TDBlockContainerImp(name, typedefLink) {}
+      : TDStoredAlignmentBlockImp(name, typedefLink, 1) {}
   int16_t GetTypeCode() const override { return static_cast<int16_t>(TypeCode::VoidBlock); }
   TDImpPtr NewInstance() const override;
-  int32_t ComputeHashValue() const override;
-  int32_t IsSameAs(const TDImp& other) const override;
-  int32_t MemberCloneOrCheckOut(TDImpPtr& target) const override;
-  int32_t MemberCheckIn(TDImpPtr& target) const override;
   int32_t DataSizeCore(ITargetPlatformAlignment*) const override { return 0; }
-  int32_t GetAlignment(ITargetPlatformAlignment*) const override { return alignment_; }
+  int32_t GetAlignment(ITargetPlatformAlignment*) const override { return GetStoredAlignment(); }
   int32_t CopyData(const void*, void*, int32_t, const KoContext*) const override { return 0; }
   int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
-  int32_t CompareForSorting(const TDImp* other) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t IsVoidBlock() const override { return 1; }
 
-  uint16_t GetStoredAlignment() const noexcept { return alignment_; }
-  void SetStoredAlignment(uint16_t alignment);
-
- private:
-  uint16_t alignment_ = 1;
+  void SetStoredAlignment(uint16_t alignment) { SetAlignmentValue(alignment); }
 };
 
 // The element repeated a number of times, each copy at the next multiple of the element's size:
