@@ -252,21 +252,66 @@ TEST_F(KoDataFlattenTest, PointersNeverTravel) {
   EXPECT_EQ(pointer, nullptr);
 }
 
-TEST_F(KoDataFlattenTest, EveryPrefixOfAGoldenValueFailsCleanly) {
+TEST_F(KoDataFlattenTest, EveryPrefixOfEveryGoldenValueFailsCleanly) {
   TDWCluster record;
   record << GetiL() << GetStringTD() << TDRArray(1, GetStringTD()) << GetPathTD();
-  const TDR type = record.CheckIn();
-  Datum value(type);
-  const std::string full = "00 00 00 07 00 00 00 02 68 69 00 00 00 02 00 00 00 01 61 00 00 00 00 50 54 48 30 00 00 00 04 00 00 00 00";
-  ASSERT_EQ(Unflatten(type, full, value.Data()), kStatusNoError);
-  const std::vector<uint8_t> bytes = FromHex(full);
-  for (size_t n = 0; n < bytes.size(); ++n) {
-    SCOPED_TRACE(n);
-    Datum partial(type);
-    InputBuf in(bytes.data(), n);
-    KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
-    EXPECT_NE(reader.ReadData(type, partial.Data(), 1), kStatusNoError);
+  TDWCluster pair;
+  pair << GetiB() << GetiL();
+  const std::vector<std::pair<TDR, std::string>> golden = {
+      {GetiL(), "00 00 00 01"},
+      {GetfD(), "3F F0 00 00 00 00 00 00"},
+      {GetfX(), "3F FF 00 00 00 00 00 00 00 00 00 00 00 00 00 00"},
+      {GetStringTD(), "00 00 00 03 61 62 63"},
+      {TDRArray(1, GetiW()), "00 00 00 02 00 01 00 02"},
+      {pair.CheckIn(), "FE 01 02 03 04"},
+      {InterpretedStringToType("{iL,fD,S}"), "00 00 00 07 3F F0 00 00 00 00 00 00 00 00 00 02 68 69"},
+      {record.CheckIn(),
+       "00 00 00 07 00 00 00 02 68 69 00 00 00 02 00 00 00 01 61 00 00 00 00 50 54 48 30 00 00 00 04 00 00 00 00"},
+  };
+  for (const auto& [type, hex] : golden) {
+    SCOPED_TRACE(hex);
+    const int64_t before = DSLiveBlockCount();
+    {
+      Datum whole(type);
+      ASSERT_EQ(Unflatten(type, hex, whole.Data()), kStatusNoError);
+      const std::vector<uint8_t> bytes = FromHex(hex);
+      for (size_t n = 0; n < bytes.size(); ++n) {
+        SCOPED_TRACE(n);
+        Datum partial(type);
+        InputBuf in(bytes.data(), n);
+        KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
+        // Input that ends early (74), or a length the input left cannot hold (116).
+        const int32_t status = reader.ReadData(type, partial.Data(), 1);
+        EXPECT_TRUE(status == kStatusCorruptData || status == kStatusImplausibleData) << status;
+      }
+    }
+    EXPECT_EQ(DSLiveBlockCount(), before);
   }
+}
+
+TEST_F(KoDataFlattenTest, ValidLongValuesAreNeverRefused) {
+  // A 3 MiB string whose bytes are all there: above the 2 MiB allowance, within 32 x the input.
+  std::vector<uint8_t> bytes(4 + (size_t{3} << 20), 'x');
+  bytes[0] = 0x00;
+  bytes[1] = 0x30;
+  bytes[2] = 0x00;
+  bytes[3] = 0x00;
+  Datum text(GetStringTD());
+  InputBuf in(bytes.data(), bytes.size());
+  KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
+  ASSERT_EQ(reader.ReadData(GetStringTD(), text.Data(), 1), kStatusNoError);
+  EXPECT_EQ((*text.Get<LStrHandle>())->cnt, 3 << 20);
+  // A million Int8 elements with their bytes.
+  const TDR bytesType = TDRArray(1, GetiB());
+  std::vector<uint8_t> array(4 + 1000000, 7);
+  array[0] = 0x00;
+  array[1] = 0x0F;
+  array[2] = 0x42;
+  array[3] = 0x40;
+  Datum million(bytesType);
+  InputBuf arrayIn(array.data(), array.size());
+  KoDataReader arrayReader(&arrayIn, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
+  EXPECT_EQ(arrayReader.ReadData(bytesType, million.Data(), 1), kStatusNoError);
 }
 
 // --- random types and values -------------------------------------------------------------------------
