@@ -42,13 +42,11 @@ uint32_t FlagsFromCodeWord(uint16_t codeWord) {
   return flags;
 }
 
-// Why a loaded descriptor is refused before anything of it is interned; null when it is not.
+// Why a descriptor is beyond what a load accepts; null when it is not.
 const char* ExceedsLimits(const TDImp& type) {
-  if (type.NestingDepth() > kMaxTypeNestingDepth) return "Type string refused: nesting deeper than 256 levels";
-  if (type.ExpandedCount() > kMaxTypeExpandedCount)
-    return "Type string refused: more than 16777216 descriptors when expanded";
-  if (type.DataSizeCore(nullptr) >= std::numeric_limits<int32_t>::max())
-    return "Type string refused: data size does not fit in 31 bits";
+  if (type.NestingDepth() > kMaxTypeNestingDepth) return "nesting deeper than 256 levels";
+  if (type.ExpandedCount() > kMaxTypeExpandedCount) return "more than 16777216 descriptors when expanded";
+  if (type.DataSizeCore(nullptr) >= std::numeric_limits<int32_t>::max()) return "data size does not fit in 31 bits";
   return nullptr;
 }
 
@@ -214,7 +212,7 @@ const TDR& TDDataReader::ConstructEltTD() {
   }
 
   if (const char* refusal = ExceedsLimits(*type)) {
-    DebugReport(__FILE__, __LINE__, 2, refusal);
+    (VELLUM_DEBUG(2) << "Type string refused: " << refusal).Process();
     // Sound bytes that describe too much: not damage, so no second message says so.
     SetError(kStatusImplausibleData);
     return GNullTD();
@@ -308,6 +306,12 @@ int32_t WriteOrdinary(TDDataWriter& writer, OutputBuf& out, const TMTypeList* li
       continue;
     }
     if (!IsSane(entry)) DebugReport(__FILE__, __LINE__, 3, "Saving an insane type descriptor.");
+    // What no load accepts is not saved either: the failure belongs to the save, not to a later load.
+    if (const char* refusal = entry ? ExceedsLimits(*entry.GetImp()) : nullptr) {
+      (VELLUM_DEBUG(2) << "Type not saved, no load would accept it: " << refusal).Process();
+      writer.SetError(kStatusBadArgument);
+      break;
+    }
     if (const int32_t status = SaveTDRecord(entry.GetImpPtr().get(), &writer, &indices[static_cast<size_t>(k)]);
         status != kStatusNoError) {
       writer.SetError(status);

@@ -577,6 +577,29 @@ TEST_F(TD80ReadWriteTest, StringsAtTheLimitsLoad) {
   EXPECT_EQ(big.DataSize(), 0x7FFFFFFE);
 }
 
+TEST_F(TD80ReadWriteTest, WhatNoLoadAcceptsIsNotSaved) {
+  TDR deep = GetiL();  // one level; 255 clusters around it make 256
+  for (int i = 0; i < 255; ++i) {
+    TDWCluster level;
+    level << deep;
+    deep = level.CheckIn();
+  }
+  TDWCluster deeper;
+  deeper << deep;
+  const TDR tooDeep = deeper.CheckIn();
+  UHandle h = nullptr;
+  ASSERT_EQ(FlattenOneType(nullptr, deep, &h, nullptr), kStatusNoError);  // 256 levels
+  TDR back;
+  EXPECT_EQ(UnFlattenOneType(nullptr, h, &back, nullptr), kStatusNoError);
+  EXPECT_EQ(back, deep);
+  DSDisposeHandle(h);
+  DebugCapture capture;
+  h = nullptr;
+  EXPECT_EQ(FlattenOneType(nullptr, tooDeep, &h, nullptr), kStatusBadArgument);
+  EXPECT_EQ(h, nullptr);
+  EXPECT_TRUE(capture.Contains("Type not saved, no load would accept it: nesting deeper than 256 levels"));
+}
+
 // --- recursion on a small stack ----------------------------------------------------------------------
 
 constexpr uint8_t kStackPattern = 0xA5;
