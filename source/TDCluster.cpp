@@ -739,7 +739,7 @@ int32_t PlainNumberParts(const TDImp& element, uint8_t* partSize) {
   }
 }
 
-void PutPart(uint8_t* into, const uint8_t* from, uint8_t size, bool swap) {
+[[gnu::always_inline]] inline void PutPart(uint8_t* into, const uint8_t* from, uint8_t size, bool swap) {
   switch (size) {
     case 1: *into = *from; return;
     case 2: {

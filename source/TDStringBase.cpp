@@ -753,8 +753,11 @@ LStrHandle LoadHandle(const void* slot) { return Load<LStrHandle>(slot); }
 }  // namespace
 
 int32_t ReadLStrValue(KoDataReader* reader, int32_t bound, LStrHandle* slot) {
-  int32_t length = 0;
-  if (reader->ReadI32(&length) != kStatusNoError) return reader->GetError();
+  const uint8_t* word = reader->TakeBytes(sizeof(int32_t));
+  if (word == nullptr) return reader->GetError();
+  uint32_t raw = Load<uint32_t>(word);
+  if (reader->GetEndianizer()->Swaps()) raw = __builtin_bswap32(raw);
+  const auto length = static_cast<int32_t>(raw);
   // The bytes must be in the input before anything is allocated for them.
   if (length < 0 || static_cast<size_t>(length) > reader->BytesLeft()) {
     (VELLUM_DEBUG(2) << "ReadData: string length " << length << " is implausible with " << reader->BytesLeft()
