@@ -523,6 +523,30 @@ bool ReportDimsDiffer(const TDArrayBaseImp& dst, const TDArrayBaseImp& src) {
   return true;
 }
 
+// Converts a datum of an Array or SubArray (`readSource` finds its elements) into an array kind of
+// the same rank: a SubArray destination becomes a view (`viewCaller` names it in diagnostics), an
+// Array gets the elements.
+using SourceReader = bool (*)(const ArrayLayout& layout, const void* data, Source* source);
+int32_t ConvertArrayKind(const TDArrayBaseImp& srcType, SourceReader readSource, const char* viewCaller,
+                         const TDImp* dst, const void* src, void* dstData, int32_t flags) {
+  if (src == nullptr || dstData == nullptr) return kStatusBadArgument;
+  if (dst == nullptr) return kStatusNullHandle;
+  if (dst->IsArray() == 0) {
+    ReportCodes(dst, srcType);
+    return kStatusBadArgument;
+  }
+  const TDArrayBaseImp& into = *AsArrayBase(dst);
+  if (ReportDimsDiffer(into, srcType)) return kStatusBadArgument;
+  if (!srcType.IsWellFormed() || !into.IsWellFormed()) {
+    ReportMalformed();
+    return kStatusNullHandle;
+  }
+  Source source;
+  if (!readSource(ArrayLayout(*srcType.GetElt(), srcType.GetNumDims()), src, &source)) return kStatusBadArgument;
+  if (dst->IsSubArrayOnly() != 0) return MakeView(into, srcType, source, dstData, viewCaller);
+  return ConvertIntoArray(static_cast<const TDArrayImp&>(into), srcType, source, dstData, flags);
+}
+
 // --- the Boolean form change -----------------------------------------------------------------------
 
 struct BooleanSearch {
@@ -1372,22 +1396,7 @@ int32_t TDArrayImp::CopyData(const void* src, void* dst, int32_t flags, const Ko
 }
 
 int32_t TDArrayImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const {
-  if (src == nullptr || dstData == nullptr) return kStatusBadArgument;
-  if (dst == nullptr) return kStatusNullHandle;
-  if (dst->IsArray() == 0) {
-    ReportCodes(dst, *this);
-    return kStatusBadArgument;
-  }
-  const TDArrayBaseImp& into = *AsArrayBase(dst);
-  if (ReportDimsDiffer(into, *this)) return kStatusBadArgument;
-  if (!IsWellFormed() || !into.IsWellFormed()) {
-    ReportMalformed();
-    return kStatusNullHandle;
-  }
-  Source source;
-  if (!ArraySource(ArrayLayout(*GetElt(), GetNumDims()), src, &source)) return kStatusBadArgument;
-  if (dst->IsSubArrayOnly() != 0) return MakeView(into, *this, source, dstData, "CopyArrayToSubArray");
-  return ConvertIntoArray(static_cast<const TDArrayImp&>(into), *this, source, dstData, flags);
+  return ConvertArrayKind(*this, &ArraySource, "CopyArrayToSubArray", dst, src, dstData, flags);
 }
 
 // --- TDSubArrayImp ---------------------------------------------------------------------------------
@@ -1438,22 +1447,7 @@ int32_t TDSubArrayImp::CopyData(const void* src, void* dst, int32_t, const KoCon
 }
 
 int32_t TDSubArrayImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const {
-  if (src == nullptr || dstData == nullptr) return kStatusBadArgument;
-  if (dst == nullptr) return kStatusNullHandle;
-  if (dst->IsArray() == 0) {
-    ReportCodes(dst, *this);
-    return kStatusBadArgument;
-  }
-  const TDArrayBaseImp& into = *AsArrayBase(dst);
-  if (ReportDimsDiffer(into, *this)) return kStatusBadArgument;
-  if (!IsWellFormed() || !into.IsWellFormed()) {
-    ReportMalformed();
-    return kStatusNullHandle;
-  }
-  Source source;
-  if (!SubArraySource(ArrayLayout(*GetElt(), GetNumDims()), src, &source)) return kStatusBadArgument;
-  if (dst->IsSubArrayOnly() != 0) return MakeView(into, *this, source, dstData, "CopySubArrayToSubArray");
-  return ConvertIntoArray(static_cast<const TDArrayImp&>(into), *this, source, dstData, flags);
+  return ConvertArrayKind(*this, &SubArraySource, "CopySubArrayToSubArray", dst, src, dstData, flags);
 }
 
 // --- TDArrayDataPtrImp -----------------------------------------------------------------------------
