@@ -616,40 +616,19 @@ int32_t ComparePackedBooleans(const uint8_t* a, const uint8_t* b, int64_t rows, 
 
 // --- counting ------------------------------------------------------------------------------------
 
-int64_t NArrayElts(int32_t nDims, const int32_t* dims, int32_t* overflow) {
-  if (overflow != nullptr) *overflow = 0;
-  if (nDims < 1) return 1;
-  bool bad = dims == nullptr;
-  bool zero = false;
-  bool tooLarge = false;
-  int64_t product = 1;
-  for (int32_t d = 0; !bad && d < nDims; ++d) {
-    const int32_t size = dims[d];
-    if (size < 0) {
-      bad = true;
-    } else if (size == 0) {
-      zero = true;
-    } else if (!tooLarge) {
-      product *= size;
-      tooLarge = product > kMaxCount;
-    }
-  }
-  if (bad || (tooLarge && !zero)) {
-    if (overflow != nullptr) *overflow = 1;
-    return 0;
-  }
-  return zero ? 0 : product;
-}
+namespace {
 
-int64_t NSubArrayElts(int32_t nDims, const SubArrayDimension* entries, int32_t* overflow) {
+// The element count of `nDims` sizes (`sizeAt(d)`): 0 when a size is 0; otherwise 0 with
+// *overflow set when a size is negative or the product passes 0x7FFFFFFF (`bad`: no sizes at all).
+template <class SizeAt>
+int64_t CountOfSizes(int32_t nDims, bool bad, SizeAt sizeAt, int32_t* overflow) {
   if (overflow != nullptr) *overflow = 0;
   if (nDims < 1) return 1;
-  bool bad = entries == nullptr;
   bool zero = false;
   bool tooLarge = false;
   int64_t product = 1;
   for (int32_t d = 0; !bad && d < nDims; ++d) {
-    const int64_t size = entries[d].dimensionSize;
+    const int64_t size = sizeAt(d);
     if (size < 0) {
       bad = true;
     } else if (size == 0) {
@@ -666,6 +645,16 @@ int64_t NSubArrayElts(int32_t nDims, const SubArrayDimension* entries, int32_t* 
     return 0;
   }
   return zero ? 0 : product;
+}
+
+}  // namespace
+
+int64_t NArrayElts(int32_t nDims, const int32_t* dims, int32_t* overflow) {
+  return CountOfSizes(nDims, dims == nullptr, [dims](int32_t d) { return static_cast<int64_t>(dims[d]); }, overflow);
+}
+
+int64_t NSubArrayElts(int32_t nDims, const SubArrayDimension* entries, int32_t* overflow) {
+  return CountOfSizes(nDims, entries == nullptr, [entries](int32_t d) { return entries[d].dimensionSize; }, overflow);
 }
 
 int64_t NArrayBinwds(int32_t nDims, const int32_t* dims, int32_t* overflow) {
