@@ -561,44 +561,39 @@ int32_t TDWSizedBlock::SetBlockSize(int32_t size) {
   return kStatusNoError;
 }
 
-uint16_t TDRAlignedBlock::GetAlignment() const {
-  const auto* block = Readable<TDAlignedBlockImp>(*this, &TDImp::IsAlignedBlock);
+namespace {
+
+// The stored alignment of a block kind, 0 for an empty handle or another kind; and its setter.
+template <class Imp>
+uint16_t StoredAlignmentOf(const TD& handle, int32_t (TDImp::*admit)() const) {
+  const auto* block = Readable<Imp>(handle, admit);
   return block != nullptr ? block->GetStoredAlignment() : 0;
 }
-uint16_t TDWAlignedBlock::GetAlignment() const {
-  const auto* block = Readable<TDAlignedBlockImp>(*this, &TDImp::IsAlignedBlock);
-  return block != nullptr ? block->GetStoredAlignment() : 0;
-}
-int32_t TDWAlignedBlock::SetAlignment(uint16_t alignment) {
-  auto* block = Writable<TDAlignedBlockImp>(*this, &TDImp::IsAlignedBlock);
+
+template <class Imp>
+int32_t SetStoredAlignmentOf(const TD& handle, int32_t (TDImp::*admit)() const, uint16_t alignment) {
+  auto* block = Writable<Imp>(handle, admit);
   if (block == nullptr) return kStatusNullHandle;
   block->SetStoredAlignment(alignment);
   return kStatusNoError;
 }
 
-uint16_t TDRTypeBlock::GetAlignment() const {
-  const auto* block = Readable<TDTypeBlockImp>(*this, &TDImp::IsTypeBlock);
-  return block != nullptr ? block->GetStoredAlignment() : 0;
+}  // namespace
+
+uint16_t TDRAlignedBlock::GetAlignment() const { return StoredAlignmentOf<TDAlignedBlockImp>(*this, &TDImp::IsAlignedBlock); }
+uint16_t TDWAlignedBlock::GetAlignment() const { return StoredAlignmentOf<TDAlignedBlockImp>(*this, &TDImp::IsAlignedBlock); }
+int32_t TDWAlignedBlock::SetAlignment(uint16_t alignment) {
+  return SetStoredAlignmentOf<TDAlignedBlockImp>(*this, &TDImp::IsAlignedBlock, alignment);
 }
-uint16_t TDWTypeBlock::GetAlignment() const {
-  const auto* block = Readable<TDTypeBlockImp>(*this, &TDImp::IsTypeBlock);
-  return block != nullptr ? block->GetStoredAlignment() : 0;
-}
+
+uint16_t TDRTypeBlock::GetAlignment() const { return StoredAlignmentOf<TDTypeBlockImp>(*this, &TDImp::IsTypeBlock); }
+uint16_t TDWTypeBlock::GetAlignment() const { return StoredAlignmentOf<TDTypeBlockImp>(*this, &TDImp::IsTypeBlock); }
 int32_t TDWTypeBlock::SetAlignment(uint16_t) { return kStatusNullHandle; }
 
-uint16_t TDRVoidBlock::GetAlignment() const {
-  const auto* block = Readable<TDVoidBlockImp>(*this, &TDImp::IsVoidBlock);
-  return block != nullptr ? block->GetStoredAlignment() : 0;
-}
-uint16_t TDWVoidBlock::GetAlignment() const {
-  const auto* block = Readable<TDVoidBlockImp>(*this, &TDImp::IsVoidBlock);
-  return block != nullptr ? block->GetStoredAlignment() : 0;
-}
+uint16_t TDRVoidBlock::GetAlignment() const { return StoredAlignmentOf<TDVoidBlockImp>(*this, &TDImp::IsVoidBlock); }
+uint16_t TDWVoidBlock::GetAlignment() const { return StoredAlignmentOf<TDVoidBlockImp>(*this, &TDImp::IsVoidBlock); }
 int32_t TDWVoidBlock::SetAlignment(uint16_t alignment) {
-  auto* block = Writable<TDVoidBlockImp>(*this, &TDImp::IsVoidBlock);
-  if (block == nullptr) return kStatusNullHandle;
-  block->SetStoredAlignment(alignment);
-  return kStatusNoError;
+  return SetStoredAlignmentOf<TDVoidBlockImp>(*this, &TDImp::IsVoidBlock, alignment);
 }
 
 uint32_t TDRRepeatedBlock::GetNumBlocks() const {
