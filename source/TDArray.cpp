@@ -893,22 +893,15 @@ int32_t TDArrayBaseImp::IsSameAs(const TDImp& other) const {
 
 int32_t TDArrayBaseImp::MemberCloneOrCheckOut(TDImpPtr& target) const {
   const int32_t status = TDSingleContainerImp::MemberCloneOrCheckOut(target);
-  if (status != kStatusNoError) return status;
-  auto& copy = static_cast<TDArrayBaseImp&>(*target);
-  try {
-    copy.dims_ = dims_;
-  } catch (const std::bad_alloc&) {
-    return kStatusOutOfMemory;
-  }
-  copy.hasDims_ = hasDims_;
-  copy.ClearHashValid();
-  return kStatusNoError;
+  return status != kStatusNoError ? status : CopyDimsInto(static_cast<TDArrayBaseImp&>(*target));
 }
 
 int32_t TDArrayBaseImp::MemberCheckIn(TDImpPtr& target) const {
   const int32_t status = TDSingleContainerImp::MemberCheckIn(target);
-  if (status != kStatusNoError) return status;
-  auto& copy = static_cast<TDArrayBaseImp&>(*target);
+  return status != kStatusNoError ? status : CopyDimsInto(static_cast<TDArrayBaseImp&>(*target));
+}
+
+int32_t TDArrayBaseImp::CopyDimsInto(TDArrayBaseImp& copy) const {
   try {
     copy.dims_ = dims_;
   } catch (const std::bad_alloc&) {

@@ -87,6 +87,9 @@ class TDArrayBaseImp : public TDSingleContainerImp {
   virtual const char* KindText() const = 0;
 
  private:
+  // The dimension list into a copy being made; 2 when memory runs out.
+  int32_t CopyDimsInto(TDArrayBaseImp& copy) const;
+
   std::vector<int32_t, PXAllocator<int32_t>> dims_;
   bool hasDims_ = false;
 };
