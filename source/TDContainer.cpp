@@ -224,29 +224,21 @@ bool TDContainerImp::WouldContainItself(const TDImp& element) const {
 
 int32_t TDSingleContainerImp::MemberCloneOrCheckOut(TDImpPtr& target) const {
   const int32_t status = TDImp::MemberCloneOrCheckOut(target);
-  if (status != kStatusNoError) return status;
-  auto& copy = static_cast<TDSingleContainerImp&>(*target);
-  copy.element_.Free();
-  copy.ClearHashValid();
-  if (element_) {
-    copy.element_ = element_->CloneOrCheckOut();
-    if (!copy.element_) return kStatusOutOfMemory;
-  }
-  return kStatusNoError;
+  return status != kStatusNoError ? status
+                                  : CopyEltInto(static_cast<TDSingleContainerImp&>(*target), &TDImp::CloneOrCheckOut);
 }
 
 int32_t TDSingleContainerImp::MemberCheckIn(TDImpPtr& target) const {
   const int32_t status = TDImp::MemberCheckIn(target);
-  if (status != kStatusNoError) return status;
-  auto& copy = static_cast<TDSingleContainerImp&>(*target);
+  return status != kStatusNoError ? status : CopyEltInto(static_cast<TDSingleContainerImp&>(*target), &TDImp::CheckIn);
+}
+
+int32_t TDSingleContainerImp::CopyEltInto(TDSingleContainerImp& copy, TDImpPtr (TDImp::*copyOf)() const) const {
   copy.element_.Free();
   copy.ClearHashValid();
-  if (element_) {
-    copy.element_ = element_->CheckIn();
-    copy.ClearHashValid();
-    if (!copy.element_) return kStatusOutOfMemory;
-  }
-  return kStatusNoError;
+  if (!element_) return kStatusNoError;
+  copy.element_ = ((*element_).*copyOf)();
+  return copy.element_ ? kStatusNoError : kStatusOutOfMemory;
 }
 
 void TDSingleContainerImp::PrintDebugStr(const uint8_t* prefix) const {
@@ -274,31 +266,16 @@ int32_t TDSingleContainerImp::ResizeAsVector(void*, int32_t, void**) const { ret
 
 int32_t TDMultiContainerImp::MemberCloneOrCheckOut(TDImpPtr& target) const {
   const int32_t status = TDImp::MemberCloneOrCheckOut(target);
-  if (status != kStatusNoError) return status;
-  auto& copy = static_cast<TDMultiContainerImp&>(*target);
-  copy.elements_.clear();
-  copy.ClearHashValid();
-  try {
-    copy.elements_.reserve(elements_.size());
-  } catch (const std::bad_alloc&) {
-    return kStatusOutOfMemory;
-  }
-  for (const TDImpPtr& element : elements_) {
-    if (!element) {
-      copy.elements_.emplace_back();
-      continue;
-    }
-    TDImpPtr cloned = element->CloneOrCheckOut();
-    if (!cloned) return kStatusOutOfMemory;
-    copy.elements_.push_back(std::move(cloned));
-  }
-  return kStatusNoError;
+  return status != kStatusNoError ? status
+                                  : CopyEltsInto(static_cast<TDMultiContainerImp&>(*target), &TDImp::CloneOrCheckOut);
 }
 
 int32_t TDMultiContainerImp::MemberCheckIn(TDImpPtr& target) const {
   const int32_t status = TDImp::MemberCheckIn(target);
-  if (status != kStatusNoError) return status;
-  auto& copy = static_cast<TDMultiContainerImp&>(*target);
+  return status != kStatusNoError ? status : CopyEltsInto(static_cast<TDMultiContainerImp&>(*target), &TDImp::CheckIn);
+}
+
+int32_t TDMultiContainerImp::CopyEltsInto(TDMultiContainerImp& copy, TDImpPtr (TDImp::*copyOf)() const) const {
   copy.elements_.clear();
   copy.ClearHashValid();
   try {
@@ -311,9 +288,9 @@ int32_t TDMultiContainerImp::MemberCheckIn(TDImpPtr& target) const {
       copy.elements_.emplace_back();
       continue;
     }
-    TDImpPtr interned = element->CheckIn();
-    if (!interned) return kStatusOutOfMemory;
-    copy.elements_.push_back(std::move(interned));
+    TDImpPtr made = ((*element).*copyOf)();
+    if (!made) return kStatusOutOfMemory;
+    copy.elements_.push_back(std::move(made));
   }
   return kStatusNoError;
 }

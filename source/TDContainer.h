@@ -89,6 +89,10 @@ class TDSingleContainerImp : public TDContainerImp {
       : TDContainerImp(name, typedefLink), element_(element) {}
 
  private:
+  // The element into a copy being made, through `copyOf` (a clone or a check-in); 2 when memory
+  // runs out.
+  int32_t CopyEltInto(TDSingleContainerImp& copy, TDImpPtr (TDImp::*copyOf)() const) const;
+
   TDImpPtr element_;
 };
 
@@ -126,6 +130,10 @@ class TDMultiContainerImp : public TDContainerImp {
       : TDContainerImp(name, typedefLink) {}
 
  private:
+  // The elements into a copy being made, through `copyOf`; absent ones stay absent. 2 when memory
+  // runs out.
+  int32_t CopyEltsInto(TDMultiContainerImp& copy, TDImpPtr (TDImp::*copyOf)() const) const;
+
   std::vector<TDImpPtr, PXAllocator<TDImpPtr>> elements_;
 };
 
