@@ -11,6 +11,7 @@
 #include <vector>
 
 #include "RandomTypes.h"
+#include "TestDatum.h"
 #include "TestSupport.h"
 #include "TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
@@ -25,71 +26,19 @@ namespace {
 
 class KoDataFlattenTest : public TypeSystemTest {};
 
-std::string Hex(const uint8_t* data, size_t size) {
-  std::string text;
-  for (size_t i = 0; i < size; ++i) {
-    char pair[4];
-    std::snprintf(pair, sizeof pair, i == 0 ? "%02X" : " %02X", data[i]);
-    text += pair;
-  }
-  return text;
-}
-
-std::vector<uint8_t> FromHex(const std::string& text) {
-  std::vector<uint8_t> bytes;
-  for (size_t i = 0; i < text.size();) {
-    if (text[i] == ' ') {
-      ++i;
-      continue;
-    }
-    bytes.push_back(static_cast<uint8_t>(std::stoul(text.substr(i, 2), nullptr, 16)));
-    i += 2;
-  }
-  return bytes;
-}
-
-// One datum of a type in properly aligned storage, inflated to the default and disposed of after.
-class Datum {
- public:
-  explicit Datum(const TDR& type) : type_(type), storage_((static_cast<size_t>(type.DataSize()) + 15) / 8 + 1, 0) {
-    EXPECT_EQ(type_.InflateDefData(Data(), 0, 1, 0), kStatusNoError);
-  }
-  ~Datum() {
-    auto* begin = static_cast<uint8_t*>(Data());
-    type_.DeflateData(begin, begin + storage_.size() * sizeof(uint64_t), 1, NormalHandleAllocator());
-  }
-  Datum(const Datum&) = delete;
-  Datum& operator=(const Datum&) = delete;
-  void* Data() { return storage_.data(); }
-  template <class T>
-  T Get(size_t offset = 0) {
-    T value;
-    std::memcpy(&value, reinterpret_cast<uint8_t*>(Data()) + offset, sizeof value);
-    return value;
-  }
-  template <class T>
-  void Set(T value, size_t offset = 0) {
-    std::memcpy(reinterpret_cast<uint8_t*>(Data()) + offset, &value, sizeof value);
-  }
-
- private:
-  TDR type_;
-  std::vector<uint64_t> storage_;
-};
-
 std::string Flatten(const TDR& type, const void* data, uint32_t version = PXApp::Instance().GetVersion()) {
   OutputBuf out;
   KoDataWriter writer(&out, version, nullptr, 0);
   const int32_t status = writer.WriteData(type, data, 1);
   if (status != kStatusNoError) return "status " + std::to_string(status);
   EXPECT_EQ(type.FlatDataSize(&writer, data), out.GetBytesWritten());
-  return Hex(out.Data(), out.GetBytesWritten());
+  return HexBytes(out.Data(), out.GetBytesWritten());
 }
 
 // Reads `hex` into `datum`; the status, and every byte must be consumed on success.
 int32_t Unflatten(const TDR& type, const std::string& hex, void* data,
                   uint32_t version = PXApp::Instance().GetVersion()) {
-  const std::vector<uint8_t> bytes = FromHex(hex);
+  const std::vector<uint8_t> bytes = BytesFromHex(hex);
   InputBuf in(bytes.data(), bytes.size());
   KoDataReader reader(&in, version, nullptr, nullptr, 0);
   const int32_t status = reader.ReadData(type, data, 1);
@@ -114,27 +63,27 @@ TEST_F(KoDataFlattenTest, GoldenValues) {
   EXPECT_EQ(Flatten(GetBoolTD(), &yes), "01");
   EXPECT_EQ(Flatten(GetBoolTD(), &yes, 0x04502003), "80 00");
 
-  Datum empty(GetStringTD());
+  Datum empty(GetStringTD(), DatumStart::kDefault);
   EXPECT_EQ(Flatten(GetStringTD(), empty.Data()), "00 00 00 00");
-  Datum abc(GetStringTD());
+  Datum abc(GetStringTD(), DatumStart::kDefault);
   LStrHandle text = nullptr;
   ASSERT_EQ(StringUtils::ToLStr("abc", &text), kStatusNoError);
-  abc.Set(text);
+  abc.Put(0, text);
   EXPECT_EQ(Flatten(GetStringTD(), abc.Data()), "00 00 00 03 61 62 63");
 
   const TDR shorts = TDRArray(1, GetiW());
-  Datum none(shorts);
+  Datum none(shorts, DatumStart::kDefault);
   EXPECT_EQ(Flatten(shorts, none.Data()), "00 00 00 00");
-  Datum two(shorts);
+  Datum two(shorts, DatumStart::kDefault);
   ASSERT_EQ(Unflatten(shorts, "00 00 00 02 00 01 00 02", two.Data()), kStatusNoError);
   EXPECT_EQ(Flatten(shorts, two.Data()), "00 00 00 02 00 01 00 02");
 
   TDWCluster pair;
   pair << GetiB() << GetiL();
   const TDR cluster = pair.CheckIn();
-  Datum packed(cluster);
-  packed.Set<int8_t>(-2);
-  packed.Set<int32_t>(0x01020304, static_cast<size_t>(TDRCluster(cluster.GetImpPtr(), 1).GetEltOffset(1)));
+  Datum packed(cluster, DatumStart::kDefault);
+  packed.Put<int8_t>(0, -2);
+  packed.Put<int32_t>(TDRCluster(cluster.GetImpPtr(), 1).GetEltOffset(1), 0x01020304);
   EXPECT_EQ(Flatten(cluster, packed.Data()), "FE 01 02 03 04");
 }
 
@@ -184,15 +133,15 @@ TEST_F(KoDataFlattenTest, ExtendedValuesTakeSixteenBytesAndKeepEveryBit) {
 
 TEST_F(KoDataFlattenTest, StringsFollowTheirBound) {
   const TDR bounded = TDRString(nullptr, 2);
-  Datum two(bounded);
+  Datum two(bounded, DatumStart::kDefault);
   ASSERT_EQ(Unflatten(bounded, "00 00 00 03 61 62 63", two.Data()), kStatusNoError);
   EXPECT_EQ(Text(two.Get<LStrHandle>()), "ab");
   const TDR fixed = TDRString(nullptr, vellum::bound::Fixed(5));
-  Datum five(fixed);
+  Datum five(fixed, DatumStart::kDefault);
   ASSERT_EQ(Unflatten(fixed, "00 00 00 03 61 62 63", five.Data()), kStatusNoError);
   EXPECT_EQ(Text(five.Get<LStrHandle>()), std::string("abc\0\0", 5));
   // A length far beyond the input is refused before anything is allocated.
-  Datum big(GetStringTD());
+  Datum big(GetStringTD(), DatumStart::kDefault);
   LiveBlockCheck blocks;
   EXPECT_EQ(Unflatten(GetStringTD(), "00 30 00 00 61 62", big.Data()), kStatusImplausibleData);
   EXPECT_EQ(big.Get<LStrHandle>(), nullptr);
@@ -203,17 +152,17 @@ TEST_F(KoDataFlattenTest, ArraysAreRefusedWhenTheirElementsCannotBeInTheInput) {
   const TDR doubles = TDRArray(1, GetfD());
   const TDR pointers = TDRArray(1, TDRPtr());
   const TDR square = TDRArray(2, GetiB());
-  Datum value(doubles);
+  Datum value(doubles, DatumStart::kDefault);
   LiveBlockCheck blocks;
   DebugCapture capture;
   EXPECT_EQ(Unflatten(doubles, "00 01 FF FF 00 00", value.Data()), kStatusImplausibleData);
   EXPECT_EQ(value.Get<UHandle>(), nullptr);
   // Elements that flatten to nothing are bounded by what a read may allocate.
-  Datum many(pointers);
+  Datum many(pointers, DatumStart::kDefault);
   EXPECT_EQ(Unflatten(pointers, "01 00 00 00", many.Data()), kStatusImplausibleData);
   ASSERT_EQ(Unflatten(pointers, "00 00 10 00", many.Data()), kStatusNoError);
   // 64-bit products that overflow are refused.
-  Datum grid(square);
+  Datum grid(square, DatumStart::kDefault);
   EXPECT_EQ(Unflatten(square, "7F FF FF FF 7F FF FF FF", grid.Data()), kStatusImplausibleData);
 }
 
@@ -221,13 +170,13 @@ TEST_F(KoDataFlattenTest, BoundedAndFixedArraysStayInTheirBlocks) {
   TDWArray bounded(0, GetiW());
   bounded.AddDim(2, 0);
   const TDR type = bounded.CheckIn();
-  Datum value(type);
+  Datum value(type, DatumStart::kDefault);
   ASSERT_EQ(Unflatten(type, "00 00 00 03 00 01 00 02 00 03", value.Data()), kStatusNoError);
   EXPECT_EQ(Flatten(type, value.Data()), "00 00 00 02 00 01 00 02");
   TDWArray fixed(0, GetiW());
   fixed.AddDim(vellum::bound::Fixed(3), 0);
   const TDR fixedType = fixed.CheckIn();
-  Datum three(fixedType);
+  Datum three(fixedType, DatumStart::kDefault);
   DebugCapture capture;
   ASSERT_EQ(Unflatten(fixedType, "00 00 00 02 00 07 00 08", three.Data()), kStatusNoError);
   EXPECT_TRUE(capture.Contains("fixed size array prealloc'd wrong?"));
@@ -236,10 +185,10 @@ TEST_F(KoDataFlattenTest, BoundedAndFixedArraysStayInTheirBlocks) {
 
 TEST_F(KoDataFlattenTest, OldBooleansArePackedSixteenToAWord) {
   const TDR flags = TDRArray(1, GetBoolTD());
-  Datum value(flags);
+  Datum value(flags, DatumStart::kDefault);
   ASSERT_EQ(Unflatten(flags, "00 00 00 03 01 00 01", value.Data()), kStatusNoError);
   EXPECT_EQ(Flatten(flags, value.Data(), 0x04502003), "00 00 00 03 A0 00");
-  Datum back(flags);
+  Datum back(flags, DatumStart::kDefault);
   ASSERT_EQ(Unflatten(flags, "00 00 00 03 A0 00", back.Data(), 0x04502003), kStatusNoError);
   EXPECT_EQ(Flatten(flags, back.Data()), "00 00 00 03 01 00 01");
 }
@@ -272,12 +221,12 @@ TEST_F(KoDataFlattenTest, EveryPrefixOfEveryGoldenValueFailsCleanly) {
     SCOPED_TRACE(hex);
     const int64_t before = DSLiveBlockCount();
     {
-      Datum whole(type);
+      Datum whole(type, DatumStart::kDefault);
       ASSERT_EQ(Unflatten(type, hex, whole.Data()), kStatusNoError);
-      const std::vector<uint8_t> bytes = FromHex(hex);
+      const std::vector<uint8_t> bytes = BytesFromHex(hex);
       for (size_t n = 0; n < bytes.size(); ++n) {
         SCOPED_TRACE(n);
-        Datum partial(type);
+        Datum partial(type, DatumStart::kDefault);
         InputBuf in(bytes.data(), n);
         KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
         // Input that ends early (74), or a length the input left cannot hold (116).
@@ -296,7 +245,7 @@ TEST_F(KoDataFlattenTest, ValidLongValuesAreNeverRefused) {
   bytes[1] = 0x30;
   bytes[2] = 0x00;
   bytes[3] = 0x00;
-  Datum text(GetStringTD());
+  Datum text(GetStringTD(), DatumStart::kDefault);
   InputBuf in(bytes.data(), bytes.size());
   KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
   ASSERT_EQ(reader.ReadData(GetStringTD(), text.Data(), 1), kStatusNoError);
@@ -308,7 +257,7 @@ TEST_F(KoDataFlattenTest, ValidLongValuesAreNeverRefused) {
   array[1] = 0x0F;
   array[2] = 0x42;
   array[3] = 0x40;
-  Datum million(bytesType);
+  Datum million(bytesType, DatumStart::kDefault);
   InputBuf arrayIn(array.data(), array.size());
   KoDataReader arrayReader(&arrayIn, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
   EXPECT_EQ(arrayReader.ReadData(bytesType, million.Data(), 1), kStatusNoError);
@@ -334,11 +283,11 @@ TEST_F(KoDataFlattenTest, RandomValuesReadBackEqualAndWriteTheSameBytes) {
     ASSERT_TRUE(type);
     const int64_t before = DSLiveBlockCount();
     {
-      Datum value(type);
-      random.Fill(type, static_cast<uint8_t*>(value.Data()));
+      Datum value(type, DatumStart::kDefault);
+      random.Fill(type, value.Data());
       const std::string flat = Flatten(type, value.Data());
       ASSERT_EQ(flat.find("status"), std::string::npos) << flat;
-      Datum back(type);
+      Datum back(type, DatumStart::kDefault);
       ASSERT_EQ(Unflatten(type, flat, back.Data()), kStatusNoError) << flat;
       EXPECT_EQ(CompareDataTDR(type, value.Data(), back.Data(), 0, 0), 0) << flat;
       EXPECT_EQ(Flatten(type, back.Data()), flat);
@@ -363,7 +312,7 @@ TEST_F(KoDataFlattenTest, AllocationFailuresDuringAReadLeaveNoLeak) {
     int32_t status = 0;
     bool fired = false;
     {
-      Datum value(type);
+      Datum value(type, DatumStart::kDefault);
       ScopedAllocationFailure failure(nth);
       status = Unflatten(type, flat, value.Data());
       fired = failure.Fired();

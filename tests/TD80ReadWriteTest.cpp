@@ -13,12 +13,14 @@
 #include <string>
 #include <vector>
 
+#include "TestDatum.h"
 #include "TestSupport.h"
 #include "TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXApp.h"
 #include "runtime/PXResources.h"
 #include "source/KoDataReader.h"
+#include "source/TD80ReadWrite.h"
 #include "runtime/PXStrings.h"
 #include "source/CoreTDTable.h"
 #include "vellum.h"
@@ -28,34 +30,12 @@ namespace {
 
 class TD80ReadWriteTest : public TypeSystemTest {};
 
-// "00 05 ..." for bytes.
-std::string Hex(const uint8_t* data, size_t size) {
-  std::string text;
-  for (size_t i = 0; i < size; ++i) {
-    char pair[4];
-    std::snprintf(pair, sizeof pair, i == 0 ? "%02X" : " %02X", data[i]);
-    text += pair;
-  }
-  return text;
-}
-
-std::vector<uint8_t> FromHex(const std::string& text) {
-  std::vector<uint8_t> bytes;
-  for (size_t i = 0; i + 1 < text.size() + 1;) {
-    while (i < text.size() && text[i] == ' ') ++i;
-    if (i + 1 >= text.size() + 0 && i >= text.size()) break;
-    bytes.push_back(static_cast<uint8_t>(std::stoul(text.substr(i, 2), nullptr, 16)));
-    i += 2;
-  }
-  return bytes;
-}
-
 std::string Flat(const TDR& type, uint32_t version = PXApp::Instance().GetVersion()) {
   const PersistTDData persist(version);
   UHandle h = nullptr;
   const int32_t status = FlattenOneType(&persist, type, &h, nullptr);
   if (status != kStatusNoError) return "status " + std::to_string(status);
-  std::string text = Hex(*h, DSGetHandleSize(h));
+  std::string text = HexBytes(*h, DSGetHandleSize(h));
   DSDisposeHandle(h);
   return text;
 }
@@ -66,7 +46,7 @@ std::string FlatList(const std::vector<TDR>& types) {
   UHandle h = nullptr;
   const int32_t status = FlattenListOfTypes(nullptr, &list, nullptr, &h, 0, nullptr, 0);
   if (status != kStatusNoError) return "status " + std::to_string(status);
-  std::string text = Hex(*h, DSGetHandleSize(h));
+  std::string text = HexBytes(*h, DSGetHandleSize(h));
   DSDisposeHandle(h);
   return text;
 }
@@ -149,7 +129,7 @@ TEST_F(TD80ReadWriteTest, CodeWordFlags) {
   EXPECT_EQ(RoundTrip(discard.CheckIn()), discard.CheckIn());
   // The event-discard bit means nothing on another code.
   TDR loaded;
-  ASSERT_EQ(Load(FromHex("00 00 00 01 00 05 01 03 00 00 01 00 00"), &loaded), kStatusNoError);
+  ASSERT_EQ(Load(BytesFromHex("00 00 00 01 00 05 01 03 00 00 01 00 00"), &loaded), kStatusNoError);
   EXPECT_EQ(loaded, GetiL());
 }
 
@@ -160,7 +140,7 @@ TEST_F(TD80ReadWriteTest, LongRecordsAndIndicesTakeFourBytes) {
   for (int i = 0; i < 200; ++i) items << (item + std::to_string(i)).c_str();
   const TDR big = TDWUInt16(items, nullptr).CheckIn();
   const std::string flat = Flat(big);
-  const std::vector<uint8_t> bytes = FromHex(flat);
+  const std::vector<uint8_t> bytes = BytesFromHex(flat);
   ASSERT_GT(bytes.size(), 32768u);
   EXPECT_EQ(bytes[4] & 0x80, 0x80) << "the size field has bit 31 set";
   const uint32_t size = ((bytes[4] & 0x7Fu) << 24) | (bytes[5] << 16) | (bytes[6] << 8) | bytes[7];
@@ -181,7 +161,7 @@ TEST_F(TD80ReadWriteTest, LongRecordsAndIndicesTakeFourBytes) {
   ASSERT_EQ(FlattenOneType(nullptr, cluster, &h, nullptr), kStatusNoError);
   const size_t total = DSGetHandleSize(h);
   // The tail: the cluster's last indices 0x80008000, 0x80008001, then one entry, index 32770.
-  EXPECT_EQ(Hex(*h + total - 14, 14), "80 00 80 00 80 00 80 01 00 01 80 00 80 02");
+  EXPECT_EQ(HexBytes(*h + total - 14, 14), "80 00 80 00 80 00 80 01 00 01 80 00 80 02");
   TDR wideBack;
   ASSERT_EQ(UnFlattenOneType(nullptr, h, &wideBack, nullptr), kStatusNoError);
   EXPECT_EQ(wideBack, cluster);
@@ -190,12 +170,12 @@ TEST_F(TD80ReadWriteTest, LongRecordsAndIndicesTakeFourBytes) {
 
 TEST_F(TD80ReadWriteTest, OneTypeLoadsAsTheSharedDescriptor) {
   TDR loaded;
-  ASSERT_EQ(Load(FromHex("00 00 00 01 00 05 00 03 00 00 01 00 00"), &loaded), kStatusNoError);
+  ASSERT_EQ(Load(BytesFromHex("00 00 00 01 00 05 00 03 00 00 01 00 00"), &loaded), kStatusNoError);
   EXPECT_EQ(loaded.GetImpPtr(), GetiL().GetImpPtr());
-  ASSERT_EQ(Load(FromHex("00 00 00 00 00 00"), &loaded), kStatusNoError);
+  ASSERT_EQ(Load(BytesFromHex("00 00 00 00 00 00"), &loaded), kStatusNoError);
   EXPECT_FALSE(loaded);
   TMTypeList list;
-  ASSERT_EQ(UnFlattenListOfTypes(nullptr, FromHex("00 00 00 00 00 00").data(), 6, &list, nullptr, 0, nullptr),
+  ASSERT_EQ(UnFlattenListOfTypes(nullptr, BytesFromHex("00 00 00 00 00 00").data(), 6, &list, nullptr, 0, nullptr),
             kStatusNoError);
   EXPECT_EQ(list.GetNumTypes(), 0);
 }
@@ -207,7 +187,7 @@ TEST_F(TD80ReadWriteTest, ExtraValuesFollowTheirIndices) {
   const uint32_t extra[] = {7, 40000};
   UHandle h = nullptr;
   ASSERT_EQ(FlattenListOfTypes(nullptr, &list, extra, &h, 0, nullptr, 0), kStatusNoError);
-  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)),
+  EXPECT_EQ(HexBytes(*h, DSGetHandleSize(h)),
             "00 00 00 02 00 05 00 03 00 00 05 00 0A 00 00 02 00 00 00 07 00 01 80 00 9C 40");
   TMTypeList back;
   uint32_t* values = nullptr;
@@ -228,7 +208,7 @@ TEST_F(TD80ReadWriteTest, SkippedEmptyEntriesReuseThePreviousIndex) {
   list.AppendType(TDR(), nullptr);
   UHandle h = nullptr;
   ASSERT_EQ(FlattenListOfTypes(nullptr, &list, nullptr, &h, 0, nullptr, 1), kStatusNoError);
-  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)), "00 00 00 01 00 05 00 0A 00 00 03 00 00 00 00 00 00");
+  EXPECT_EQ(HexBytes(*h, DSGetHandleSize(h)), "00 00 00 01 00 05 00 0A 00 00 03 00 00 00 00 00 00");
   DSDisposeHandle(h);
 }
 
@@ -250,26 +230,26 @@ TEST_F(TD80ReadWriteTest, DamagedStringsFailWithAMessage) {
   DebugCapture capture;
   TDR out;
   // A record size below 4.
-  EXPECT_EQ(Load(FromHex("00 00 00 01 00 03 00 03 00 01 00 00"), &out), kStatusOutOfMemory);
+  EXPECT_EQ(Load(BytesFromHex("00 00 00 01 00 03 00 03 00 01 00 00"), &out), kStatusOutOfMemory);
   // An unknown code.
-  EXPECT_EQ(Load(FromHex("00 00 00 01 00 04 00 EE 00 01 00 00"), &out), kStatusOutOfMemory);
+  EXPECT_EQ(Load(BytesFromHex("00 00 00 01 00 04 00 EE 00 01 00 00"), &out), kStatusOutOfMemory);
   EXPECT_TRUE(capture.Contains("ConstructEltTD(): type code 238 is invalid.")) << ::testing::PrintToString(capture.Texts());
   // Truncated in the middle of a record.
-  EXPECT_EQ(Load(FromHex("00 00 00 01 00 08 00 30 FF FF"), &out), kStatusOutOfMemory);
+  EXPECT_EQ(Load(BytesFromHex("00 00 00 01 00 08 00 30 FF FF"), &out), kStatusOutOfMemory);
   // A container whose element index is outside the table.
-  EXPECT_EQ(Load(FromHex("00 00 00 01 00 06 00 40 00 01 FF FF FF FF 00 05 00 01 00 00"), &out),
+  EXPECT_EQ(Load(BytesFromHex("00 00 00 01 00 06 00 40 00 01 FF FF FF FF 00 05 00 01 00 00"), &out),
             kStatusOutOfMemory);
   // An entry index outside the table is the null descriptor.
-  ASSERT_EQ(Load(FromHex("00 00 00 01 00 05 00 03 00 00 01 00 07"), &out), kStatusNoError);
+  ASSERT_EQ(Load(BytesFromHex("00 00 00 01 00 05 00 03 00 00 01 00 07"), &out), kStatusNoError);
   EXPECT_FALSE(out);
   // More than one entry for one type.
   capture.Clear();
-  EXPECT_EQ(Load(FromHex("00 00 00 01 00 05 00 03 00 00 02 00 00 00 00"), &out), kStatusNullHandle);
+  EXPECT_EQ(Load(BytesFromHex("00 00 00 01 00 05 00 03 00 00 02 00 00 00 00"), &out), kStatusNullHandle);
   EXPECT_TRUE(capture.Contains("UnFlattenOneType : We're only supposed to have one type."));
   // Counts far beyond the input reserve nothing they cannot fill.
-  EXPECT_EQ(Load(FromHex("FF FF FF FF 00 05"), &out), kStatusOutOfMemory);
+  EXPECT_EQ(Load(BytesFromHex("FF FF FF FF 00 05"), &out), kStatusOutOfMemory);
   TMTypeList list;
-  const std::vector<uint8_t> manyEntries = FromHex("00 00 00 00 7F FF");
+  const std::vector<uint8_t> manyEntries = BytesFromHex("00 00 00 00 7F FF");
   EXPECT_EQ(UnFlattenListOfTypes(nullptr, manyEntries.data(), 6, &list, nullptr, 0, nullptr), kStatusOutOfMemory);
   EXPECT_EQ(UnFlattenListOfTypes(nullptr, manyEntries.data(), 6, nullptr, nullptr, 0, nullptr), kStatusBadArgument);
 }
@@ -289,6 +269,21 @@ TEST_F(TD80ReadWriteTest, ClustersTooWideToLoadAreNotSaved) {
   EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"Too many elements in a container to save: 65536",
                                                        "Saving type descriptors encountered an error!",
                                                        "KoDataWriter finished with 1 error"}));
+}
+
+TEST_F(TD80ReadWriteTest, LoadTableIndicesOutsideTheTableAreNull) {
+  const std::vector<uint8_t> bytes = BytesFromHex("00 05 00 03 00 00 00");
+  InputBuf in(bytes.data(), bytes.size());
+  TDDataReader reader(nullptr, &in, nullptr);
+  ASSERT_EQ(reader.ConstructEltTD(), GetiL());
+  EXPECT_EQ(reader.RetrieveTDFromLoadTableByIndex(0), GetiL());
+  DebugCapture capture;
+  EXPECT_FALSE(reader.RetrieveTDFromLoadTableByIndex(3));
+  EXPECT_FALSE(reader.RetrieveTDFromLoadTableByIndex(-1));
+  EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"Invalid type index: 3, 1", "Invalid type index: -1, 1"}));
+  // Read from the stream: index 0 is the one record, the next one is outside and null.
+  EXPECT_EQ(reader.GetTypeRef(), GetiL());
+  EXPECT_FALSE(reader.GetTypeRef());
 }
 
 TEST_F(TD80ReadWriteTest, NullOutputHandleIsRefused) {
@@ -319,14 +314,14 @@ TEST_F(TD80ReadWriteTest, ConsolidatedListsReferToTheSharedList) {
   list.AppendType(GetfD(), nullptr);
   UHandle h = nullptr;
   ASSERT_EQ(FlattenListOfTypes(&persist, &list, nullptr, &h, 0, nullptr, 0), kStatusNoError);
-  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)), "00 02 00 01");
+  EXPECT_EQ(HexBytes(*h, DSGetHandleSize(h)), "00 02 00 01");
   ASSERT_EQ(shared.GetNumTypes(), 2);
   DSDisposeHandle(h);
   // The same run again is found where it stands; a one-type reference has no count.
   TMTypeList second;
   second.AppendType(GetfD(), nullptr);
   ASSERT_EQ(FlattenListOfTypes(&persist, &second, nullptr, &h, 1, nullptr, 0), kStatusNoError);
-  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)), "00 02");
+  EXPECT_EQ(HexBytes(*h, DSGetHandleSize(h)), "00 02");
   EXPECT_EQ(shared.GetNumTypes(), 2);
   TDR back;
   ASSERT_EQ(UnFlattenOneType(&persist, h, &back, nullptr), kStatusNoError);
@@ -344,13 +339,13 @@ TEST_F(TD80ReadWriteTest, DeferredReferencesPassThroughThePendingQueue) {
   DebugCapture capture;
   const PersistTDData persist(nullptr, nullptr, PXApp::Instance().GetVersion(), kPersistDeferIndices);
   TMTypeList read;
-  const std::vector<uint8_t> bytes = FromHex("00 05");
+  const std::vector<uint8_t> bytes = BytesFromHex("00 05");
   ASSERT_EQ(UnFlattenListOfTypes(&persist, bytes.data(), 2, &read, nullptr, 1, nullptr), kStatusNoError);
   TMTypeList list;
   list.AppendType(GetiL(), nullptr);
   UHandle h = nullptr;
   ASSERT_EQ(FlattenListOfTypes(&persist, &list, nullptr, &h, 1, nullptr, 0), kStatusNoError);
-  EXPECT_EQ(Hex(*h, DSGetHandleSize(h)), "00 05");
+  EXPECT_EQ(HexBytes(*h, DSGetHandleSize(h)), "00 05");
   DSDisposeHandle(h);
   // The queue is empty now.
   EXPECT_EQ(FlattenListOfTypes(&persist, &list, nullptr, &h, 1, nullptr, 0), kStatusNullHandle);
@@ -363,7 +358,7 @@ TEST_F(TD80ReadWriteTest, TypesInsideDataAndTheOldFormatHooks) {
     KoDataWriter writer(&out, PXApp::Instance().GetVersion(), nullptr, 0);
     ASSERT_EQ(writer.WriteTD(GetStringTD()), kStatusNoError);
   }
-  EXPECT_EQ(Hex(out.Data(), out.GetBytesWritten()), "00 00 00 01 00 08 00 30 FF FF FF FF 00 01 00 00");
+  EXPECT_EQ(HexBytes(out.Data(), out.GetBytesWritten()), "00 00 00 01 00 08 00 30 FF FF FF FF 00 01 00 00");
   InputBuf in(out.Data(), out.GetBytesWritten());
   KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
   EXPECT_EQ(reader.ReadTD(), GetStringTD());
@@ -383,7 +378,7 @@ TEST_F(TD80ReadWriteTest, TypesInsideDataAndTheOldFormatHooks) {
     KoDataWriter writer(&old, 0x07000000, nullptr, 0);
     ASSERT_EQ(writer.WriteTD(GetfD()), kStatusNoError);
   }
-  EXPECT_EQ(Hex(old.Data(), old.GetBytesWritten()), "0A");
+  EXPECT_EQ(HexBytes(old.Data(), old.GetBytesWritten()), "0A");
   InputBuf oldIn(old.Data(), old.GetBytesWritten());
   KoDataReader oldReader(&oldIn, 0x07000000, nullptr, nullptr, 0);
   EXPECT_EQ(oldReader.ReadTD(), GetfD());

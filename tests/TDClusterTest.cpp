@@ -15,6 +15,7 @@
 #include <vector>
 
 #include "RandomTypes.h"
+#include "TestDatum.h"
 #include "TestSupport.h"
 #include "TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
@@ -49,29 +50,6 @@ TDRCluster Cluster(const std::vector<TDR>& elements, const char* name = nullptr)
   return cluster.CheckIn();
 }
 
-// One datum of a type in zeroed, aligned memory, given back (deflated) when it goes.
-class Datum {
- public:
-  explicit Datum(const TD& type) : type_(type), bytes_(static_cast<size_t>(type.DataSize()) + 8, 0) {}
-  ~Datum() { type_.DeflateData(Data(), Data() + type_.DataSize(), 1, NormalHandleAllocator()); }
-  Datum(const Datum&) = delete;
-  Datum& operator=(const Datum&) = delete;
-  uint8_t* Data() { return reinterpret_cast<uint8_t*>(bytes_.data()); }
-  template <class T>
-  T At(int32_t offset) {
-    T value;
-    std::memcpy(&value, Data() + offset, sizeof value);
-    return value;
-  }
-  template <class T>
-  void Put(int32_t offset, T value) {
-    std::memcpy(Data() + offset, &value, sizeof value);
-  }
-
- private:
-  TD type_;
-  std::vector<uint64_t> bytes_;
-};
 
 std::vector<uint8_t> HandleBytes(LStrHandle h) {
   if (h == nullptr) return {};
@@ -203,18 +181,18 @@ TEST_F(TDClusterTest, DefaultDataHasTheExactBlocksAndGoesBackWhole) {
     Datum datum(cluster);
     datum.Put<int32_t>(0, 77);
     ASSERT_EQ(cluster.InflateDefData(datum.Data(), 0, 1, 0), kStatusNoError);
-    EXPECT_EQ(datum.At<int32_t>(0), 0);
-    EXPECT_EQ(HandleBytes(datum.At<LStrHandle>(8)), LStrBlock(3, 3));
-    EXPECT_EQ(HandleBytes(datum.At<LStrHandle>(16)), LStrBlock(0, 5));
-    EXPECT_EQ(datum.At<LStrHandle>(24), nullptr);
-    EXPECT_EQ(datum.At<double>(32), 0.0);
+    EXPECT_EQ(datum.Get<int32_t>(0), 0);
+    EXPECT_EQ(HandleBytes(datum.Get<LStrHandle>(8)), LStrBlock(3, 3));
+    EXPECT_EQ(HandleBytes(datum.Get<LStrHandle>(16)), LStrBlock(0, 5));
+    EXPECT_EQ(datum.Get<LStrHandle>(24), nullptr);
+    EXPECT_EQ(datum.Get<double>(32), 0.0);
     EXPECT_EQ(DSLiveBlockCount(), before + 2);
     EXPECT_EQ(cluster.VerifyData(datum.Data(), nullptr), kStatusNoError);
     // Deflating without dispose keeps fixed and bounded blocks.
     EXPECT_EQ(cluster.DeflateData(datum.Data(), datum.Data() + 40, 0, NormalHandleAllocator()), 0);
     EXPECT_EQ(DSLiveBlockCount(), before + 2);
     EXPECT_EQ(cluster.DeflateData(datum.Data(), datum.Data() + 40, 1, NormalHandleAllocator()), 7 + 9);
-    EXPECT_EQ(datum.At<LStrHandle>(8), nullptr);
+    EXPECT_EQ(datum.Get<LStrHandle>(8), nullptr);
     EXPECT_EQ(DSLiveBlockCount(), before);
   }
   EXPECT_EQ(DSLiveBlockCount(), before);
@@ -227,8 +205,8 @@ TEST_F(TDClusterTest, DeflateStopsAtTheEndPointer) {
   ASSERT_EQ(cluster.InflateDefData(datum.Data(), 0, 1, 0), kStatusNoError);
   const int64_t before = DSLiveBlockCount();
   cluster.DeflateData(datum.Data(), datum.Data() + 8, 1, NormalHandleAllocator());
-  EXPECT_EQ(datum.At<LStrHandle>(0), nullptr);
-  EXPECT_NE(datum.At<LStrHandle>(8), nullptr);
+  EXPECT_EQ(datum.Get<LStrHandle>(0), nullptr);
+  EXPECT_NE(datum.Get<LStrHandle>(8), nullptr);
   EXPECT_EQ(DSLiveBlockCount(), before - 1);
 }
 
@@ -249,9 +227,9 @@ TEST_F(TDClusterTest, ResetTurnsEveryElementToItsDefault) {
   ASSERT_EQ(StringUtils::ToLStr("hello", &text), kStatusNoError);
   datum.Put<LStrHandle>(8, text);
   EXPECT_EQ(cluster.ResetToDefaultData(datum.Data()), kStatusNoError);
-  EXPECT_EQ(datum.At<int32_t>(0), 0);
-  EXPECT_EQ(LHStrLen(datum.At<LStrHandle>(8)), 0);
-  EXPECT_EQ(HandleBytes(datum.At<LStrHandle>(16)), LStrBlock(2, 2));
+  EXPECT_EQ(datum.Get<int32_t>(0), 0);
+  EXPECT_EQ(LHStrLen(datum.Get<LStrHandle>(8)), 0);
+  EXPECT_EQ(HandleBytes(datum.Get<LStrHandle>(16)), LStrBlock(2, 2));
 }
 
 TEST_F(TDClusterTest, CopyMovesABlockOrDuplicatesHandles) {
@@ -272,9 +250,9 @@ TEST_F(TDClusterTest, CopyMovesABlockOrDuplicatesHandles) {
   ASSERT_EQ(StringUtils::ToLStr("abc", &text), kStatusNoError);
   from.Put<LStrHandle>(8, text);
   EXPECT_EQ(cluster.CopyData(from.Data(), into.Data(), nullptr, 0), kStatusNoError);
-  EXPECT_EQ(into.At<int32_t>(0), 42);
-  EXPECT_NE(into.At<LStrHandle>(8), text);
-  EXPECT_EQ(StringUtils::FromLStr(into.At<LStrHandle>(8)), "abc");
+  EXPECT_EQ(into.Get<int32_t>(0), 42);
+  EXPECT_NE(into.Get<LStrHandle>(8), text);
+  EXPECT_EQ(StringUtils::FromLStr(into.Get<LStrHandle>(8)), "abc");
   EXPECT_EQ(cluster.CopyData(nullptr, into.Data(), nullptr, 0), kStatusBadArgument);
   EXPECT_EQ(cluster.CopyData(from.Data(), nullptr, nullptr, 0), kStatusBadArgument);
   EXPECT_EQ(TDRCluster(TDImpPtr(), 0).CopyData(from.Data(), into.Data(), nullptr, 0), kStatusNullHandle);

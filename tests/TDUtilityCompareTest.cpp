@@ -15,6 +15,7 @@
 #include <string>
 #include <vector>
 
+#include "TestDatum.h"
 #include "TestSupport.h"
 #include "TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
@@ -37,36 +38,6 @@ int32_t Sign(int64_t v) { return v < 0 ? -1 : (v > 0 ? 1 : 0); }
 // The order BlockCmp gives two byte strings of one length.
 int32_t BytesOrder(const void* a, const void* b, size_t n) { return Sign(std::memcmp(a, b, n)); }
 
-// One datum of a type in zeroed, aligned memory; its handles are given back when it goes.
-class Datum {
- public:
-  explicit Datum(const TDR& type) : type_(type), bytes_((static_cast<size_t>(type.DataSize()) + 15) / 8, 0) {}
-  ~Datum() { type_.DeflateData(Data(), Data() + type_.DataSize(), 1, NormalHandleAllocator()); }
-  Datum(const Datum&) = delete;
-  Datum& operator=(const Datum&) = delete;
-
-  uint8_t* Data() { return reinterpret_cast<uint8_t*>(bytes_.data()); }
-  template <class T>
-  void Put(int64_t offset, T value) {
-    std::memcpy(Data() + offset, &value, sizeof value);
-  }
-  // A string element at `offset` takes the text.
-  void PutString(int64_t offset, const std::string& text) {
-    LStrHandle h = nullptr;
-    std::memcpy(&h, Data() + offset, sizeof h);
-    ASSERT_EQ(StringUtils::ToLStr(text, &h), kStatusNoError);
-    std::memcpy(Data() + offset, &h, sizeof h);
-  }
-  UHandle Handle(int64_t offset = 0) {
-    UHandle h = nullptr;
-    std::memcpy(&h, Data() + offset, sizeof h);
-    return h;
-  }
-
- private:
-  TDR type_;
-  std::vector<uint64_t> bytes_;
-};
 
 int32_t Compare(const TDR& type, Datum& a, Datum& b, int32_t bytewise = 0) {
   return CompareDataTDR(type, a.Data(), b.Data(), 0, bytewise);

@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "TestDatum.h"
 #include "TestSupport.h"
 #include "TypeSystemFixture.h"
 #include "runtime/PXApp.h"
@@ -17,16 +18,6 @@
 namespace {
 
 class TypeStringRoundTripTest : public TypeSystemTest {};
-
-std::string Hex(const std::vector<uint8_t>& bytes) {
-  std::string text;
-  for (const uint8_t b : bytes) {
-    char pair[4];
-    std::snprintf(pair, sizeof pair, "%02X ", b);
-    text += pair;
-  }
-  return text;
-}
 
 std::vector<uint8_t> Bytes(UHandle h) {
   if (h == nullptr) return {};
@@ -362,7 +353,7 @@ std::string SmallestFailingPart(const TDR& type) {
       smallest = bytes;
     }
   }
-  return smallest.empty() ? std::string("none alone") : Hex(smallest);
+  return smallest.empty() ? std::string("none alone") : HexBytes(smallest);
 }
 
 TEST_F(TypeStringRoundTripTest, RandomTreesComeBackAsTheSameDescriptor) {
@@ -385,11 +376,11 @@ TEST_F(TypeStringRoundTripTest, RandomTreesComeBackAsTheSameDescriptor) {
     bytesSeen += bytes.size();
     int32_t status = 0;
     const TDR back = LoadOne(persist, bytes, &status);
-    ASSERT_EQ(status, kStatusNoError) << Hex(bytes);
+    ASSERT_EQ(status, kStatusNoError) << HexBytes(bytes);
     ASSERT_EQ(back.GetImpPtr(), type.GetImpPtr())
-        << Hex(bytes) << "\nsmallest failing part: " << SmallestFailingPart(type);
+        << HexBytes(bytes) << "\nsmallest failing part: " << SmallestFailingPart(type);
     ASSERT_EQ(FlatOne(persist == nullptr ? &current : nullptr, type), bytes) << "saving again wrote other bytes";
-    ASSERT_EQ(capture.Texts(), std::vector<std::string>()) << Hex(bytes);
+    ASSERT_EQ(capture.Texts(), std::vector<std::string>()) << HexBytes(bytes);
   }
   EXPECT_GT(bytesSeen, 100000u) << "the trees are too small to test much";
 }
@@ -435,9 +426,9 @@ TEST_F(TypeStringRoundTripTest, RandomListsKeepTheirEntries) {
     TMTypeList back;
     uint32_t* values = nullptr;
     ASSERT_EQ(UnFlattenListOfTypes(nullptr, h, &back, withExtra ? &values : nullptr, 0, nullptr), kStatusNoError)
-        << Hex(bytes);
+        << HexBytes(bytes);
     DSDisposeHandle(h);
-    ASSERT_EQ(back.GetNumTypes(), static_cast<int32_t>(entries.size())) << Hex(bytes);
+    ASSERT_EQ(back.GetNumTypes(), static_cast<int32_t>(entries.size())) << HexBytes(bytes);
     // A skipped entry repeats the index of the one before it; a first one refers to record 0.
     TDR firstRecord;
     for (const TDR& entry : entries) {
@@ -450,7 +441,7 @@ TEST_F(TypeStringRoundTripTest, RandomListsKeepTheirEntries) {
     for (size_t k = 0; k < entries.size(); ++k) {
       expected = entries[k] ? entries[k] : k == 0 ? firstRecord : expected;
       EXPECT_EQ(back.GetType(static_cast<uint32_t>(k)).GetImpPtr(), expected.GetImpPtr())
-          << "entry " << k << " " << Hex(bytes);
+          << "entry " << k << " " << HexBytes(bytes);
       if (withExtra && values != nullptr) {
         EXPECT_EQ(values[k], extra[k]) << "entry " << k;
       }
