@@ -1,5 +1,5 @@
-// Reads arbitrary bytes as a type string, for the running version and for one before the flag
-// byte and qualified typedef names existed. Whatever is accepted must save to a type string that
+// Reads arbitrary bytes as a type string, for the running version, for one before the flag byte
+// and alignment markers existed, and for one before typedefs held qualified names. Whatever is accepted must save to a type string that
 // loads back and saves to the same bytes again; for the running version, which can say all that
 // a record can hold, it must load back as the same interned descriptors. Nothing may leak once
 // the type manager has stopped.
@@ -59,6 +59,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     CheckRoundTrip(data, size, 0x22308000, true);
     // Flags an old record cannot hold (the generic bit) are read but not written back.
     CheckRoundTrip(data, size, 0x08600000, false);
+    CheckRoundTrip(data, size, 0x08006000, false);
     services.StopAll();
   }
   if (DSLiveBlockCount() != liveBefore) std::abort();

@@ -10,7 +10,7 @@
 #include <type_traits>
 
 struct DebugMessage {
-  std::string module;  // the source file's base name without directory and extension
+  std::string module;  // the reporting module's name
   int32_t line;
   int32_t level;       // 0 informational, 1 collection log, 2-3 errors, 4 must abort
   std::string text;
@@ -34,7 +34,9 @@ void Forward(DebugStream& s, const T& v);
 // Builds one message. Usage: (VELLUM_DEBUG(3) << "bad count " << n).Process();
 class DebugStream {
  public:
-  DebugStream(const char* file, int32_t line, int32_t level);
+  // `module` is the module's name, or a source file's path, whose base name without extension
+  // is taken.
+  DebugStream(const char* module, int32_t line, int32_t level);
   DebugStream(const DebugStream&) = delete;
   DebugStream& operator=(const DebugStream&) = delete;
 
@@ -98,10 +100,19 @@ void Forward(DebugStream& s, const T& v) {
 }
 }  // namespace debugstream_detail
 
-#define VELLUM_DEBUG(level) DebugStream(__FILE__, __LINE__, (level))
+// Every .cpp that reports names its module once, after its includes:
+//   VELLUM_DIAGNOSTIC_MODULE("TDArray");
+// so that moving or splitting a file never changes the module its messages carry.
+#define VELLUM_DIAGNOSTIC_MODULE(name)                                \
+  namespace {                                                         \
+  [[maybe_unused]] constexpr const char* kDiagnosticModule = (name); \
+  }                                                                   \
+  static_assert(true)
 
-// One whole message in one call.
-void DebugReport(const char* file, int32_t line, int32_t level, std::string_view text);
+#define VELLUM_DEBUG(level) DebugStream(kDiagnosticModule, __LINE__, (level))
+
+// One whole message in one call; `module` as for the DebugStream constructor.
+void DebugReport(const char* module, int32_t line, int32_t level, std::string_view text);
 
 // The module name a message from `file` carries: "TD" for ".../source/TD.cpp".
 std::string DebugModuleName(const char* file);

@@ -10,6 +10,8 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXInternal.h"
 
+VELLUM_DIAGNOSTIC_MODULE("PlacementDelete");
+
 namespace {
 
 struct Registry {
@@ -34,7 +36,7 @@ void RegisterPlacementDelete(void (*destroy)(void*), void* object) {
   } catch (const std::bad_alloc&) {
   }
   // The object then lives until the process ends: a leak at exit, never a dangling pointer.
-  DebugReport(__FILE__, __LINE__, 3, "Placement delete could not be registered");
+  DebugReport(kDiagnosticModule, __LINE__, 3, "Placement delete could not be registered");
 }
 
 void RunPlacementDeletes() {

@@ -20,6 +20,8 @@
 #include "source/TypeManager.h"
 #include "vellum/TypeManagerHooks.h"
 
+VELLUM_DIAGNOSTIC_MODULE("CoreTDTable");
+
 ITDDictionary::~ITDDictionary() = default;
 
 namespace {
@@ -176,7 +178,7 @@ void RegisterDictionary(ITDDictionary* dictionary) {
     if (gDictionaries[i] == dictionary) return;
   }
   if (count >= kMaxDictionaries) {
-    DebugReport(__FILE__, __LINE__, 4, "Too many dictionaries registered");
+    DebugReport(kDiagnosticModule, __LINE__, 4, "Too many dictionaries registered");
     return;
   }
   gDictionaries[count] = dictionary;
@@ -292,7 +294,7 @@ void GarbageCollectDictionaries() {
     for (size_t i = 0; i < passes.size(); ++i) line << (i == 0 ? "" : ",") << passes[i].first;
     line << "]" << lastTotal << ", " << Percent(static_cast<double>(freed), static_cast<double>(firstTotal)) << "%("
          << freed << "/" << firstTotal << ")}";
-    DebugReport(__FILE__, __LINE__, 1, line.str());
+    DebugReport(kDiagnosticModule, __LINE__, 1, line.str());
   }
   if (GarbageCollectingListener listener = gListener.load(std::memory_order_acquire)) listener(false);
 }

@@ -7,6 +7,9 @@
 
 #include "runtime/DebugStream.h"
 #include "runtime/PXApp.h"
+#include "vellum/TypeCodes.h"
+
+VELLUM_DIAGNOSTIC_MODULE("KoCMutate");
 
 namespace {
 
@@ -144,4 +147,8 @@ uint32_t GetBranchCompatibleVersion(uint32_t version, uint32_t current) {
   for (const VersionPair& pair : row->pairs)
     if (version <= pair.limit) return pair.equivalent;
   return current + 1;
+}
+
+uint32_t FirstVersionWithTypeCode(int32_t code) {
+  return code == static_cast<int32_t>(TypeCode::AlignmentMarker) ? kAlignmentMarkerVersion : 0;
 }

@@ -15,3 +15,10 @@ bool VersionShouldMutate(uint32_t saved, uint32_t mutation, uint32_t current);
 // it; any other version comes back unchanged.
 uint32_t GetBranchCompatibleVersion(uint32_t version);
 uint32_t GetBranchCompatibleVersion(uint32_t version, uint32_t current);
+
+// Alignment markers were added in this version.
+constexpr uint32_t kAlignmentMarkerVersion = 0x08602000;
+
+// The first version whose type strings can hold a record of `code` (0 for kinds as old as the
+// format): writers refuse to save the kind for an earlier version, and readers refuse such a record.
+uint32_t FirstVersionWithTypeCode(int32_t code);

@@ -9,6 +9,8 @@
 #include "source/TD.h"
 #include "source/TD80ReadWrite.h"
 
+VELLUM_DIAGNOSTIC_MODULE("KoDataReader");
+
 KoDataReader::KoDataReader(InputBuf* in, uint32_t version, const KoContext* context,
                            const Endianizer* endianizer, ReaderOptions options)
     : BinDataReader(in, endianizer), options_(options), persist_(&own_), own_(version, context) {}
@@ -103,7 +105,7 @@ TDR KoDataReader::ReadTD() {
   if (GetVersion() < 0x08002184) {
     const ReadOldTDProc readOld = GetReadOldTDProc();
     if (readOld == nullptr) {
-      DebugReport(__FILE__, __LINE__, 4, "No callback to read old TD");
+      DebugReport(kDiagnosticModule, __LINE__, 4, "No callback to read old TD");
       SetError(kStatusNullHandle);
       return TDR();
     }

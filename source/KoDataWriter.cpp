@@ -11,6 +11,8 @@
 #include "source/TD.h"
 #include "vellum/TypeStrings.h"
 
+VELLUM_DIAGNOSTIC_MODULE("KoDataWriter");
+
 namespace {
 
 constexpr int32_t kLargestShortSizeField = 0x7FFF;
@@ -42,7 +44,7 @@ PersistTDData::PersistTDData(TMTypeList* typeList, const KoContext* context, uin
       version_(version),
       apiVersion_(apiVersion != 0 ? apiVersion : PXApp::Instance().GetVersion()),
       options_(options) {
-  if (version_ > apiVersion_) DebugReport(__FILE__, __LINE__, 3, "The API version should be passed to KoDataWriter");
+  if (version_ > apiVersion_) DebugReport(kDiagnosticModule, __LINE__, 3, "The API version should be passed to KoDataWriter");
   Init();
   SetTypeList(typeList);
 }
@@ -155,7 +157,7 @@ int32_t KoDataWriter::WriteTD(const TDR& type) {
   if (GetVersion() < kVariantVersionWordVersion) {
     const WriteOldTDProc writeOld = GetWriteOldTDProc();
     if (writeOld == nullptr) {
-      DebugReport(__FILE__, __LINE__, 4, "No callback to write old TD");
+      DebugReport(kDiagnosticModule, __LINE__, 4, "No callback to write old TD");
       SetError(kStatusNullHandle);
       return GetError();
     }

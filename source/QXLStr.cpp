@@ -12,6 +12,8 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXStrings.h"
 
+VELLUM_DIAGNOSTIC_MODULE("QXLStr");
+
 namespace {
 
 constexpr size_t kCountBytes = offsetof(LStr, str);

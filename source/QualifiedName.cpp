@@ -13,6 +13,8 @@
 #include "runtime/PXPath.h"
 #include "runtime/PXStrings.h"
 
+VELLUM_DIAGNOSTIC_MODULE("QualifiedName");
+
 namespace {
 
 constexpr uint8_t kDelimiter = ':';

@@ -16,6 +16,8 @@
 #include "vellum/TDVisitor.h"
 #include "vellum/TypeManagerHooks.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TD");
+
 namespace {
 
 
@@ -111,7 +113,7 @@ int32_t TDImp::EphemeralizeTD(int32_t queryOnly) {
   const int32_t old = static_cast<int32_t>(Flags() & kTDFlagEphemeral);
   ClearHashValid();
   if (IsFunction() != 0) {
-    DebugReport(__FILE__, __LINE__, 3, "EphemeralizeTD on functionCode?");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "EphemeralizeTD on functionCode?");
     return 0;
   }
   if (queryOnly == 0) SetFlagBits(kTDFlagEphemeral);
@@ -253,7 +255,7 @@ int32_t TDImp::FlattenTDForSaving(TDDataWriter* writer, int32_t* index) const {
   if (name_ && name_->HasText()) name_->Flatten(writer);
   if (writer->GetError() != kStatusNoError) return writer->GetError();
   if (writer->GetBytesWritten() - start != static_cast<size_t>(size) && IsFunction() == 0)
-    DebugReport(__FILE__, __LINE__, 3, "We calculated the wrong size.");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "We calculated the wrong size.");
   if (index != nullptr) *index = -1;
   return kStatusNoError;
 }

@@ -10,9 +10,12 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXResources.h"
 #include "source/CoreTDTable.h"
+#include "source/KoCMutate.h"
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
 #include "vellum/TypeManagerHooks.h"
+
+VELLUM_DIAGNOSTIC_MODULE("TD80ReadWrite");
 
 namespace {
 
@@ -185,6 +188,14 @@ const TDR& TDDataReader::ConstructEltTD() {
     SetError(kStatusNullHandle);
     return GNullTD();
   }
+  // A writer of an older version cannot save this kind, so no string of that version holds one.
+  if (GetVersion() < FirstVersionWithTypeCode(code)) {
+    (VELLUM_DEBUG(2) << "Type string refused: type code " << code << " did not exist in version ")
+        .AppendHex32(GetVersion())
+        .Process();
+    SetError(kStatusImplausibleData);
+    return GNullTD();
+  }
   int32_t status = kStatusNoError;
   TDImpPtr type = factory->CreateTD(this, code, &status);
   if (status == kStatusNoError && !type) status = kStatusOutOfMemory;
@@ -227,7 +238,7 @@ const TDR& TDDataReader::ConstructEltTD() {
     return GNullTD();
   }
   const TDR& loaded = table_.back();
-  if (!IsSane(loaded)) DebugReport(__FILE__, __LINE__, 3, "UnFlattenListOfTypes : Loading an insane type descriptor.");
+  if (!IsSane(loaded)) DebugReport(kDiagnosticModule, __LINE__, 3, "UnFlattenListOfTypes : Loading an insane type descriptor.");
   return loaded;
 }
 
@@ -249,7 +260,7 @@ int32_t WriteConsolidated(TDDataWriter& writer, const PersistTDData& persist, co
   if (persist.DefersIndices()) {
     uint32_t reference = 0;
     if (single == 0 || !persist.PopPendingIndex(&reference)) {
-      DebugReport(__FILE__, __LINE__, 3, "invalid call");
+      DebugReport(kDiagnosticModule, __LINE__, 3, "invalid call");
       return kStatusNullHandle;
     }
     writer.WriteVariableSizeField(static_cast<int32_t>(reference));
@@ -257,7 +268,7 @@ int32_t WriteConsolidated(TDDataWriter& writer, const PersistTDData& persist, co
   }
   TMTypeList* shared = persist.GetTypeList();
   if (shared == nullptr) {
-    DebugReport(__FILE__, __LINE__, 3, "invalid call");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "invalid call");
     return kStatusNullHandle;
   }
   // A run of equal descriptors already in the shared list is referred to where it stands.
@@ -273,7 +284,7 @@ int32_t WriteConsolidated(TDDataWriter& writer, const PersistTDData& persist, co
     for (int32_t k = 0; k < count; ++k) {
       TDR entry = list->GetType(static_cast<uint32_t>(k));
       if (!entry) {
-        if (skipNull == 0) DebugReport(__FILE__, __LINE__, 3, "");
+        if (skipNull == 0) DebugReport(kDiagnosticModule, __LINE__, 3, "");
         entry = MakeDefaultTDRForTypeCode(static_cast<int32_t>(TypeCode::Void));
       }
       uint32_t position = 0;
@@ -305,7 +316,7 @@ int32_t WriteOrdinary(TDDataWriter& writer, OutputBuf& out, const TMTypeList* li
       indices[static_cast<size_t>(k)] = k > 0 ? indices[static_cast<size_t>(k) - 1] : 0;
       continue;
     }
-    if (!IsSane(entry)) DebugReport(__FILE__, __LINE__, 3, "Saving an insane type descriptor.");
+    if (!IsSane(entry)) DebugReport(kDiagnosticModule, __LINE__, 3, "Saving an insane type descriptor.");
     // What no load accepts is not saved either: the failure belongs to the save, not to a later load.
     if (const char* refusal = entry ? ExceedsLimits(*entry.GetImp()) : nullptr) {
       (VELLUM_DEBUG(2) << "Type not saved, no load would accept it: " << refusal).Process();
@@ -337,7 +348,7 @@ int32_t WriteOrdinary(TDDataWriter& writer, OutputBuf& out, const TMTypeList* li
 int32_t FlattenListOfTypes(const PersistTDData* persist, const TMTypeList* list, const uint32_t* extra,
                            UHandle* outHandle, int32_t single, const Endianizer* endianizer, int32_t skipNull) {
   if (outHandle == nullptr) {
-    DebugReport(__FILE__, __LINE__, 3, "FlattenListOfTypes : Do not pass hdl as NULL in FlattenListOfTypes");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "FlattenListOfTypes : Do not pass hdl as NULL in FlattenListOfTypes");
     return kStatusNullHandle;
   }
   static const BigEndianizer kBigEndian;
@@ -348,7 +359,7 @@ int32_t FlattenListOfTypes(const PersistTDData* persist, const TMTypeList* list,
                              ? WriteConsolidated(writer, context, list, extra, single, skipNull)
                              : WriteOrdinary(writer, out, list, extra, skipNull);
   if (status != kStatusNoError || writer.GetError() != kStatusNoError) {
-    DebugReport(__FILE__, __LINE__, 2, "Saving type descriptors encountered an error!");
+    DebugReport(kDiagnosticModule, __LINE__, 2, "Saving type descriptors encountered an error!");
     return status != kStatusNoError ? status : writer.GetError();
   }
   return HandOut(out, outHandle);
@@ -487,7 +498,7 @@ int32_t UnFlattenListOfTypes(const PersistTDData* persist, const uint8_t* data, 
                              ? ReadConsolidated(reader, context, out, outExtra, single)
                              : ReadOrdinary(reader, out, outExtra);
   if (reader.GetError() == kStatusCorruptData)
-    DebugReport(__FILE__, __LINE__, 2, "UnFlattenListOfTypes : The type string is damaged or ends early.");
+    DebugReport(kDiagnosticModule, __LINE__, 2, "UnFlattenListOfTypes : The type string is damaged or ends early.");
   return status;
 }
 
@@ -507,7 +518,7 @@ int32_t UnFlattenOneType(const PersistTDData* persist, const uint8_t* data, uint
       status != kStatusNoError)
     return status;
   if (list.GetNumTypes() > 1) {
-    DebugReport(__FILE__, __LINE__, 3, "UnFlattenOneType : We're only supposed to have one type.");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "UnFlattenOneType : We're only supposed to have one type.");
     return kStatusNullHandle;
   }
   *out = list.GetNumTypes() == 1 ? list.GetType(0) : GNullTD();

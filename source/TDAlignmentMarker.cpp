@@ -6,9 +6,12 @@
 #include <string>
 
 #include "runtime/DebugStream.h"
+#include "source/KoCMutate.h"
 #include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
+
+VELLUM_DIAGNOSTIC_MODULE("TDAlignmentMarker");
 
 namespace {
 
@@ -61,7 +64,7 @@ int32_t TDAlignmentMarkerImp::CopyDataConvertCore(const TDImp* dst, const void*,
 
 void TDAlignmentMarkerImp::PrintDebugStr(const uint8_t* prefix) const {
   const std::string text = prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-  DebugReport(__FILE__, __LINE__, 0, text + "type = alignment marker");
+  DebugReport(kDiagnosticModule, __LINE__, 0, text + "type = alignment marker");
   TDSingleContainerImp::PrintDebugStr(prefix);
 }
 
@@ -104,8 +107,8 @@ TDWCluster InheritTDWFromParentTDR(const TDRCluster& parent) {
 }
 
 int32_t TDAlignmentMarkerImp::FlattenTDPartsForSaving(TDDataWriter* writer) const {
-  if (writer->GetVersion() < 0x08602000) {
-    DebugReport(__FILE__, __LINE__, 3, "Invalid type write");
+  if (writer->GetVersion() < kAlignmentMarkerVersion) {
+    DebugReport(kDiagnosticModule, __LINE__, 3, "Invalid type write");
     writer->SetError(kStatusNullHandle);
     return kStatusNullHandle;
   }

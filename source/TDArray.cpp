@@ -29,6 +29,8 @@
 #include "vellum/TDSimpleHandles.h"
 #include "vellum/TDStringHandles.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDArray");
+
 namespace {
 
 using vellum::bound::IsBounded;
@@ -75,22 +77,22 @@ std::string PrefixText(const uint8_t* prefix) {
   return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
 }
 
-void ReportMalformed() { DebugReport(__FILE__, __LINE__, 3, "Array type without dimension list or element"); }
-void ReportOverflow() { DebugReport(__FILE__, __LINE__, 3, "Array number of elements overflowed"); }
-void ReportDamagedBlock() { DebugReport(__FILE__, __LINE__, 3, "Array block smaller than its dimension sizes"); }
+void ReportMalformed() { DebugReport(kDiagnosticModule, __LINE__, 3, "Array type without dimension list or element"); }
+void ReportOverflow() { DebugReport(kDiagnosticModule, __LINE__, 3, "Array number of elements overflowed"); }
+void ReportDamagedBlock() { DebugReport(kDiagnosticModule, __LINE__, 3, "Array block smaller than its dimension sizes"); }
 void ReportTooLarge(const char* who, int64_t count) {
   (VELLUM_DEBUG(3) << who << ": array too large? nstrt=" << count).Process();
 }
 void ReportPreallocatedSource() {
-  DebugReport(__FILE__, __LINE__, 3,
+  DebugReport(kDiagnosticModule, __LINE__, 3,
               "Attempting to copy from array whose type thinks it needs more memory than what is preallocated.");
 }
 void ReportPreallocatedDestination() {
-  DebugReport(__FILE__, __LINE__, 3,
+  DebugReport(kDiagnosticModule, __LINE__, 3,
               "Attempting to copy to an array whose type thinks it needs more memory than what is preallocated.");
 }
 void ReportPreallocatedExisting() {
-  DebugReport(__FILE__, __LINE__, 3,
+  DebugReport(kDiagnosticModule, __LINE__, 3,
               "Array exists whose type thinks it needs more memory than what is preallocated.");
 }
 void ReportCodes(const TDImp* dst, const TDImp& src) {
@@ -345,7 +347,7 @@ bool SubArraySource(const ArrayLayout& layout, const void* data, Source* source)
   const int64_t count = source->Count(&overflow);
   const auto* first = Load<const uint8_t*>(data);
   if (overflow || (count > 0 && first == nullptr)) {
-    DebugReport(__FILE__, __LINE__, 3, "CopySubArrayConvert?");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "CopySubArrayConvert?");
     return false;
   }
   source->first = first;
@@ -444,7 +446,7 @@ int32_t ConvertIntoArray(const TDArrayImp& dstType, const TDArrayBaseImp& srcTyp
   if (same && !into.handles && source.handle != nullptr) {
     const bool fits = fixed ? srcCount == capacity : srcCount <= capacity;
     if (!fits || static_cast<int64_t>(DSGetHandleSize(source.handle)) < capacityBytes) {
-      DebugReport(__FILE__, __LINE__, 3, "CompareTD didn't return sCvtLen?");
+      DebugReport(kDiagnosticModule, __LINE__, 3, "CompareTD didn't return sCvtLen?");
       return kStatusBadArgument;
     }
     MoveBlock(*source.handle, *h, static_cast<size_t>(capacityBytes));
@@ -457,7 +459,7 @@ int32_t ConvertIntoArray(const TDArrayImp& dstType, const TDArrayBaseImp& srcTyp
   for (int32_t d = 0; d < into.nDims; ++d) {
     const int32_t bound = dstType.GetDimSize(d);
     if (IsFixed(bound) && DimsOf(h)[d] != Length(bound)) {
-      DebugReport(__FILE__, __LINE__, 3, "fixed size array prealloc'd wrong?");
+      DebugReport(kDiagnosticModule, __LINE__, 3, "fixed size array prealloc'd wrong?");
       return kStatusOutOfMemory;
     }
   }
@@ -730,7 +732,7 @@ int32_t SetArraySizeFromTDR2(const TDR& elt, int32_t nDims, UHandle* handle, int
                              int32_t inflateFlags) {
   if (!elt) return kStatusNullHandle;
   if (elt.IsArrayBase() != 0) {
-    DebugReport(__FILE__, __LINE__, 3, "SetArraySizeFromTDR: array element cannot be an array");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "SetArraySizeFromTDR: array element cannot be an array");
     return kStatusBadArgument;
   }
   if (nDims < 0) {
@@ -965,7 +967,7 @@ int32_t TDArrayBaseImp::CmpTD(const TDImp* source, int32_t flags, int32_t) const
     result = kCmpIncompatible;
   } else {
     if (IsArrayInterface() != other->IsArrayInterface()) {
-      DebugReport(__FILE__, __LINE__, 0,
+      DebugReport(kDiagnosticModule, __LINE__, 0,
                   "TDArrayBaseImp::CmpTD : Should check array dimensions and datatype before setting sConvert.");
       return kCmpNeedsConversion;
     }
@@ -1118,7 +1120,7 @@ int32_t TDArrayImp::ResetToDefaultData(void* data) const {
   const int64_t bytes = layout.packed ? 2 * PackedWordsOfSizes(layout.nDims, Dims()) : n * layout.eltSize;
   const int64_t need = n == 0 ? kDimWordSize * layout.nDims : layout.header + bytes;
   if (static_cast<int64_t>(DSGetHandleSize(h)) < need) {
-    DebugReport(__FILE__, __LINE__, 3, "ResetToDefaultArrayData?");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "ResetToDefaultArrayData?");
     return kStatusOutOfMemory;
   }
   for (int32_t d = 0; d < layout.nDims; ++d) DimsOf(h)[d] = DefaultWord(GetDimSize(d));
@@ -1306,7 +1308,7 @@ int32_t CopyBooleanForm(const TDArrayImp& type, const ArrayLayout& layout, int32
                         int32_t flags, const KoContext* context) {
   const UHandle from = Load<UHandle>(src);
   if (from != nullptr && from == Load<UHandle>(dst)) {
-    DebugReport(__FILE__, __LINE__, 3, "wrong type for boolean convert");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "wrong type for boolean convert");
     return kStatusBadArgument;
   }
   int64_t count = 0;
@@ -1338,7 +1340,7 @@ int32_t CopyBooleanForm(const TDArrayImp& type, const ArrayLayout& layout, int32
     return kStatusNoError;
   }
   if (layout.elt->IsBool() != 0 || layout.elt->IsBoolU16() != 0) {
-    DebugReport(__FILE__, __LINE__, 3, "wrong type for boolean convert");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "wrong type for boolean convert");
     return kStatusBadArgument;
   }
   for (int64_t i = 0; i < count; ++i) {
@@ -1556,7 +1558,7 @@ enum class RecordPart { kDataPtr, kDimSize, kStride };
 
 int32_t RecordOffset(const TD& type, int32_t dim, ITargetPlatformAlignment* platform, RecordPart part) {
   if (part != RecordPart::kDataPtr && (dim < 0 || dim >= NumDimsOf(type))) {
-    DebugReport(__FILE__, __LINE__, 3, " Invalid dimension");
+    DebugReport(kDiagnosticModule, __LINE__, 3, " Invalid dimension");
     return 0;
   }
   if (platform == nullptr) {
@@ -1678,7 +1680,7 @@ int32_t TDRArray::SetArraySize(UHandle* handle, int32_t count) const {
   const TDArrayBaseImp* array = AsArrayBase(GetImp());
   if (array == nullptr || !array->IsWellFormed()) return kStatusNullHandle;
   if (array->GetElt()->IsArrayBase() != 0) {
-    DebugReport(__FILE__, __LINE__, 3, "SetArraySizeFromTDPtr: array element cannot be an array");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "SetArraySizeFromTDPtr: array element cannot be an array");
     return kStatusBadArgument;
   }
   const ArrayLayout layout(*array->GetElt(), array->GetNumDims());
@@ -1689,7 +1691,7 @@ int32_t TDRArray::SetArraySize(UHandle* handle, int32_t count, const int32_t* di
   const TDArrayBaseImp* array = AsArrayBase(GetImp());
   if (array == nullptr || !array->IsWellFormed()) return kStatusNullHandle;
   if (array->GetElt()->IsArrayBase() != 0) {
-    DebugReport(__FILE__, __LINE__, 3, "SetArraySizeFromTDPtr: array element cannot be an array");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "SetArraySizeFromTDPtr: array element cannot be an array");
     return kStatusBadArgument;
   }
   const ArrayLayout layout(*array->GetElt(), array->GetNumDims());
@@ -1726,7 +1728,7 @@ int32_t FixedArrayTDR(const TDRArrayBase& type, int32_t* err) {
   if (err != nullptr) *err = kStatusNoError;
   const TDArrayBaseImp* array = AsArrayBase(type.GetImp());
   if (array == nullptr) {
-    DebugReport(__FILE__, __LINE__, 3, "This is not an array type!");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "This is not an array type!");
     if (err != nullptr) *err = kStatusNullHandle;
     return 0;
   }
@@ -1877,7 +1879,7 @@ int32_t ReadIntoPreallocated(KoDataReader* reader, const TDArrayImp& type, const
     const int32_t word = type.GetDimSize(d);
     const int32_t limit = vellum::bound::Length(word);
     if (vellum::bound::IsFixed(word) && sizes[d] != limit)
-      DebugReport(__FILE__, __LINE__, 3, "fixed size array prealloc'd wrong?");
+      DebugReport(kDiagnosticModule, __LINE__, 3, "fixed size array prealloc'd wrong?");
     kept[static_cast<size_t>(d)] = vellum::bound::IsFixed(word) ? limit : std::min(sizes[d], limit);
     same = same && kept[static_cast<size_t>(d)] == sizes[d];
   }
@@ -2042,7 +2044,7 @@ int32_t TDArrayImp::ReadData(KoDataReader* reader, void* data, int32_t count, in
       continue;
     }
     if (h == nullptr || static_cast<int64_t>(DSGetHandleSize(h)) < need) {
-      DebugReport(__FILE__, __LINE__, 3,
+      DebugReport(kDiagnosticModule, __LINE__, 3,
                   "Array exists whose type thinks it needs more memory than what is preallocated.");
       reader->SetError(kStatusOutOfMemory);
       break;
@@ -2102,7 +2104,7 @@ int32_t TDSubArrayImp::WriteData(KoDataWriter* writer, const void* data, int32_t
 }
 
 int32_t TDSubArrayImp::ReadData(KoDataReader* reader, void*, int32_t, int32_t* status) const {
-  DebugReport(__FILE__, __LINE__, 2, "ReadData does not handle subArrays!");
+  DebugReport(kDiagnosticModule, __LINE__, 2, "ReadData does not handle subArrays!");
   reader->SetError(kStatusBadArgument);
   if (status != nullptr) *status = reader->GetError();
   return 0;

@@ -11,6 +11,8 @@
 #include "source/CoreTDTable.h"
 #include "source/TD80ReadWrite.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDAttributes");
+
 namespace {
 
 constexpr uint32_t kTypedefOneNameVersion = 0x08006016;  // older typedefs hold one name
@@ -168,13 +170,40 @@ int32_t TDTypedefImp::IsEqual(const TDAttributeImp& other) const {
   return FPathCmp(viPath_, link.viPath_) == 0 ? 1 : 0;
 }
 
+namespace {
+
+// A typedef of a version before qualified names holds one name, its file name, in a PStr padded
+// to even length: what a reader of that version reads back.
+size_t OneNameFlatSize(const QualifiedName& name) {
+  const size_t length = name.NumElts() > 0 ? name.GetFileName().size() : 0;
+  return (length + 2) & ~size_t{1};
+}
+
+}  // namespace
+
 void TDTypedefImp::AddFlatSize(int32_t* size, const TDDataWriter* writer) const {
-  *size += 8 + viName_.GetFlatSize(writer->GetVersion());
+  const uint32_t version = writer->GetVersion();
+  *size += 8 + (version < kTypedefOneNameVersion ? static_cast<int32_t>(OneNameFlatSize(viName_))
+                                                  : viName_.GetFlatSize(version));
 }
 
 int32_t TDTypedefImp::Flatten(TDDataWriter* writer) const {
   writer->WriteU32(timeStamp_);
-  viName_.Flatten(writer);
+  if (writer->GetVersion() >= kTypedefOneNameVersion) {
+    viName_.Flatten(writer);
+    return writer->GetError();
+  }
+  const std::string fileName = viName_.NumElts() > 0 ? viName_.GetFileName() : std::string();
+  if (fileName.size() > 255) {
+    (VELLUM_DEBUG(2) << "A typedef name of more than 255 bytes cannot be saved for version ")
+        .AppendHex32(writer->GetVersion())
+        .Process();
+    writer->SetError(kStatusBadArgument);
+    return kStatusBadArgument;
+  }
+  writer->WriteU8(static_cast<uint8_t>(fileName.size()));
+  writer->WriteBytes(fileName.data(), fileName.size());
+  if (fileName.size() % 2 == 0) writer->WriteU8(0);
   return writer->GetError();
 }
 

@@ -18,6 +18,8 @@
 #include "vellum/TDNumericHandles.h"
 #include "vellum/TDOtherHandles.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDBlock");
+
 namespace {
 
 constexpr int64_t kMaxDataSize = std::numeric_limits<int32_t>::max();
@@ -468,7 +470,7 @@ int32_t TDRepeatedBlockImp::CopyData(const void* src, void* dst, int32_t flags, 
 int32_t TDRepeatedBlockImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const {
   const TDRepeatedBlockImp* into = AsRepeatedBlock(dst);
   if (into == nullptr) {
-    DebugReport(__FILE__, __LINE__, 3, "CopyDataConvert:  destination is not a repeated block!");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "CopyDataConvert:  destination is not a repeated block!");
     return kStatusBadArgument;
   }
   if (into->numBlocks_ != numBlocks_) {

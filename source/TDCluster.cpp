@@ -21,6 +21,8 @@
 #include "source/TDStringBase.h"
 #include "source/TypeManager.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDCluster");
+
 namespace {
 
 constexpr int64_t kMaxDataSize = std::numeric_limits<int32_t>::max();
@@ -130,7 +132,7 @@ int32_t CopyBooleanForm(const TDImp& srcType, const TDImp& dstType, const void* 
   return kStatusNoError;
 }
 
-void ReportNotACluster() { DebugReport(__FILE__, __LINE__, 3, "CopyDataConvert:  destination is not a cluster!"); }
+void ReportNotACluster() { DebugReport(kDiagnosticModule, __LINE__, 3, "CopyDataConvert:  destination is not a cluster!"); }
 
 
 

@@ -12,6 +12,8 @@
 #include "source/TD80ReadWrite.h"
 #include "source/TDAttributes.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDContainer");
+
 namespace {
 
 std::string PrefixText(const uint8_t* prefix) {

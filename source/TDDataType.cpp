@@ -10,6 +10,8 @@
 #include "runtime/PlacementDelete.h"
 #include "source/TDAttributes.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDDataType");
+
 namespace {
 
 alignas(TDR) unsigned char gNullTDStorage[sizeof(TDR)];
@@ -171,14 +173,14 @@ int32_t TD::CmpTD(const TD& other, int32_t flags) const {
 
 int32_t TD::PrintDebugStr(const uint8_t* prefix) const {
   const std::string text = prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-  DebugReport(__FILE__, __LINE__, 0, text + "TypeDescriptor {");
+  DebugReport(kDiagnosticModule, __LINE__, 0, text + "TypeDescriptor {");
   if (!imp_) {
-    DebugReport(__FILE__, __LINE__, 0, text + "\tNULL");
+    DebugReport(kDiagnosticModule, __LINE__, 0, text + "\tNULL");
   } else {
     const std::string inner = text + "\t";
     imp_->PrintDebugStr(reinterpret_cast<const uint8_t*>(inner.c_str()));
   }
-  DebugReport(__FILE__, __LINE__, 0, text + "\t}");
+  DebugReport(kDiagnosticModule, __LINE__, 0, text + "\t}");
   return 0;
 }
 

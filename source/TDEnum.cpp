@@ -16,6 +16,8 @@
 #include "source/CoreTDTable.h"
 #include "source/TD80ReadWrite.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDEnum");
+
 namespace {
 
 constexpr size_t kMaxItemLength = 255;
@@ -287,7 +289,7 @@ int32_t ComparePrefix(const TDAttributeImpPtr& p, const TDAttribute& other) {
   const TDEnumImp* enumeration = EnumOf(p);
   const TDEnumImp* others = EnumOf(other.GetAttributeImpPtr());
   if (enumeration == nullptr || others == nullptr) {
-    DebugReport(__FILE__, __LINE__, 3, "Not implemented");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "Not implemented");
     return 0;
   }
   return enumeration->ComparePrefix(*others);

@@ -19,6 +19,8 @@
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDNumeric");
+
 namespace {
 
 constexpr double kInfinity = std::numeric_limits<double>::infinity();
@@ -736,14 +738,14 @@ int32_t TDBasicNumericImp::CopyAttributes(const TDImp* src, uint32_t mask) {
 
 void TDBasicNumericImp::PrintDebugStr(const uint8_t* prefix) const {
   const std::string text = PrefixText(prefix);
-  DebugReport(__FILE__, __LINE__, 0, text + "\ttype = " + InfoOf(GetTypeCode()).debugName);
+  DebugReport(kDiagnosticModule, __LINE__, 0, text + "\ttype = " + InfoOf(GetTypeCode()).debugName);
   const std::string inner = text + "\t";
   TDImp::PrintDebugStr(reinterpret_cast<const uint8_t*>(inner.c_str()));
   if (enum_) enum_->PrintDebugStr(prefix);
   if (units_) units_->PrintDebugStr(prefix);
   char flags[8];
   std::snprintf(flags, sizeof flags, "0x%02x", static_cast<unsigned>(numFlags_));
-  DebugReport(__FILE__, __LINE__, 0, std::string(" numFlags= ") + flags);
+  DebugReport(kDiagnosticModule, __LINE__, 0, std::string(" numFlags= ") + flags);
 }
 
 // --- free functions of the family ----------------------------------------------------------------
@@ -751,10 +753,10 @@ void TDBasicNumericImp::PrintDebugStr(const uint8_t* prefix) const {
 int32_t DecimalDigitsForAutoPrecisionOfCode(int32_t code) {
   const BasicNumericInfo* info = FindBasicNumeric(code);
   if (info == nullptr) {
-    DebugReport(__FILE__, __LINE__, 3, "Bad tc");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "Bad tc");
     return 0;
   }
-  if (!info->autoPrecisionSupported) DebugReport(__FILE__, __LINE__, 3, "Not yet supported");
+  if (!info->autoPrecisionSupported) DebugReport(kDiagnosticModule, __LINE__, 3, "Not yet supported");
   return info->autoPrecisionDigits;
 }
 

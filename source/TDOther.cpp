@@ -11,6 +11,8 @@
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDOther");
+
 namespace {
 
 constexpr int32_t kPointerSize = 8;
@@ -24,7 +26,7 @@ std::string PrefixText(const uint8_t* prefix) {
 }
 
 void PrintKind(const TDImp& type, const char* kind, const uint8_t* prefix) {
-  DebugReport(__FILE__, __LINE__, 0, PrefixText(prefix) + "type = " + kind);
+  DebugReport(kDiagnosticModule, __LINE__, 0, PrefixText(prefix) + "type = " + kind);
   type.TDImp::PrintDebugStr(prefix);
 }
 

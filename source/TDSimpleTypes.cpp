@@ -12,6 +12,8 @@
 #include "source/TypeManager.h"
 #include "vellum/TDVisitor.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDSimpleTypes");
+
 namespace {
 
 
@@ -150,7 +152,7 @@ const TDR& GetBoolTD() {
 int32_t MutateBooleanTD(TDImpPtr* type, int32_t toOld) {
   if (type == nullptr || !*type) return 0;
   if ((*type)->IsReadOnlyTD() != 0) {
-    DebugReport(__FILE__, __LINE__, 3, "What are you doing?  This TDImpPtr is readonly!");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "What are you doing?  This TDImpPtr is readonly!");
     return 0;
   }
   return (*type)->MutateBooleanTD(type, toOld);
@@ -200,7 +202,7 @@ int32_t TDBooleanImp::ReadData(KoDataReader* reader, void* data, int32_t count, 
   const size_t start = reader->Position();
   auto* bytes = static_cast<uint8_t*>(data);
   if (reader->GetVersion() < kOneByteBooleanVersion) {
-    if (count != 1) DebugReport(__FILE__, __LINE__, 3, "should not be doing multiple old bools");
+    if (count != 1) DebugReport(kDiagnosticModule, __LINE__, 3, "should not be doing multiple old bools");
     for (int32_t i = 0; i < count; ++i) {
       const uint8_t value = reader->ReadBool();
       if (bytes != nullptr) bytes[i] = value;
@@ -217,11 +219,11 @@ int32_t TDBooleanImp::ReadData(KoDataReader* reader, void* data, int32_t count, 
 }
 
 int32_t TDBooleanU16Imp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  DebugReport(__FILE__, __LINE__, 3, "Can't flatten old style boolean.");
+  DebugReport(kDiagnosticModule, __LINE__, 3, "Can't flatten old style boolean.");
   return TDImp::WriteData(writer, data, count, status);
 }
 
 int32_t TDBooleanU16Imp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  DebugReport(__FILE__, __LINE__, 3, "Can't unflatten old style boolean.");
+  DebugReport(kDiagnosticModule, __LINE__, 3, "Can't unflatten old style boolean.");
   return TDImp::ReadData(reader, data, count, status);
 }

@@ -25,6 +25,8 @@
 #include "vellum/TDNumericHandles.h"
 #include "vellum/TDOtherHandles.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDStringBase");
+
 namespace {
 
 using vellum::bound::IsFixed;
@@ -57,7 +59,7 @@ std::string PrefixText(const uint8_t* prefix) {
 }
 
 void ReportPreallocatedTooSmall() {
-  DebugReport(__FILE__, __LINE__, 3,
+  DebugReport(kDiagnosticModule, __LINE__, 3,
               "Preallocated string exists whose type thinks it needs more memory than what is preallocated.");
 }
 
@@ -93,11 +95,11 @@ int32_t StoreBounded(const uint8_t* bytes, int32_t count, LStrHandle* dst, int32
     return tooSmallStatus;
   }
   if (*dst == nullptr) return kStatusNoError;
-  if (length == 0) DebugReport(__FILE__, __LINE__, 3, "empty bound/fixed string alloc'd?");
+  if (length == 0) DebugReport(kDiagnosticModule, __LINE__, 3, "empty bound/fixed string alloc'd?");
   const int32_t copied = std::min(length, count);
   if (IsFixed(bound)) {
     if (LengthWord(*dst) != length) {
-      DebugReport(__FILE__, __LINE__, 3, "fixed string len prealloc'd wrong?");
+      DebugReport(kDiagnosticModule, __LINE__, 3, "fixed string len prealloc'd wrong?");
       return kStatusBadArgument;
     }
     MoveBlock(bytes, Bytes(*dst), static_cast<size_t>(copied));
@@ -130,7 +132,7 @@ void ReportConvertCodes4(const TDImp* dst, const TDImp& src) {
   std::snprintf(text, sizeof text, "CopyDataConvert tcDst=0x%04x, tcSrc=0x%04x",
                 static_cast<unsigned>(static_cast<uint16_t>(dst != nullptr ? dst->GetTypeCode() : 0)),
                 static_cast<unsigned>(static_cast<uint16_t>(src.GetTypeCode())));
-  DebugReport(__FILE__, __LINE__, 3, text);
+  DebugReport(kDiagnosticModule, __LINE__, 3, text);
 }
 
 // Copies the string at `src` (null: empty) into data of `dstType` (String, Pict or Tag): a
@@ -378,9 +380,9 @@ int32_t TDStringBaseImp::CmpTD(const TDImp* source, int32_t flags, int32_t) cons
 
 void TDStringBaseImp::PrintDebugStr(const uint8_t* prefix) const {
   const std::string text = PrefixText(prefix);
-  DebugReport(__FILE__, __LINE__, 0, text + "type = " + KindText());
+  DebugReport(kDiagnosticModule, __LINE__, 0, text + "type = " + KindText());
   TDImp::PrintDebugStr(prefix);
-  DebugReport(__FILE__, __LINE__, 0, text + "bound = " + std::to_string(bound_));
+  DebugReport(kDiagnosticModule, __LINE__, 0, text + "bound = " + std::to_string(bound_));
 }
 
 // --- TDStringBaseImp: data of a counted string in a handle ---------------------------------------
@@ -630,7 +632,7 @@ int32_t TDPathImp::CopyData(const void* src, void* dst, int32_t, const KoContext
 
 int32_t TDPathImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const {
   if (dst == nullptr || dst->IsPath() == 0) {
-    DebugReport(__FILE__, __LINE__, 3, "CopyDataConvert:  destination is not a path!");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "CopyDataConvert:  destination is not a path!");
     return kStatusBadArgument;
   }
   return CopyData(src, dstData, flags, nullptr);
@@ -774,7 +776,7 @@ int32_t ReadLStrValue(KoDataReader* reader, int32_t bound, LStrHandle* slot) {
   // The destination is the caller's datum: its handles are live.
   const size_t have = DSGetLiveHandleSize(h);
   if (!vellum::bound::IsVariable(bound) && h != nullptr && have != need)
-    DebugReport(__FILE__, __LINE__, 3, "fixed/bounded str was preallocated to wrong size?");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "fixed/bounded str was preallocated to wrong size?");
   if ((h == nullptr || have < need) && !reader->MayAllocate(need)) return reader->GetError();
   if (h == nullptr || have != need) {
     const int32_t status = DSSetHandleSizeOrNewHandle(&h, need);
@@ -859,7 +861,7 @@ int32_t TDSubStringImp::WriteData(KoDataWriter* writer, const void* data, int32_
 }
 
 int32_t TDSubStringImp::ReadData(KoDataReader* reader, void*, int32_t, int32_t* status) const {
-  DebugReport(__FILE__, __LINE__, 2, "ReadData does not handle subStrings!");
+  DebugReport(kDiagnosticModule, __LINE__, 2, "ReadData does not handle subStrings!");
   if (status != nullptr) *status = reader->GetError();
   return 0;
 }

@@ -12,6 +12,8 @@
 #include "source/TDAttributes.h"
 #include "source/TypeManager.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDTagBase");
+
 namespace {
 
 // The kinds whose tags convert into each other.
@@ -163,7 +165,7 @@ void TDTagBaseImp::SetContext(const KoContext* context) {
 int32_t TDTagBaseImp::SetTagType(TagType tagType) {
   // The user-defined kind has a class of its own, which a plain tag has no room for.
   if ((tagType == kTagTypeUserDefined) != (IsUserDefinedTag() != 0)) {
-    DebugReport(__FILE__, __LINE__, 3, "Illegal SetTagType setting!");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "Illegal SetTagType setting!");
     return kStatusBadArgument;
   }
   tagType_ = tagType;
@@ -174,7 +176,7 @@ int32_t TDTagBaseImp::SetTagType(TagType tagType) {
 void TDTagBaseImp::PrintDebugStr(const uint8_t* prefix) const {
   TDStringBaseImp::PrintDebugStr(prefix);
   const std::string text = PrefixText(prefix);
-  DebugReport(__FILE__, __LINE__, 0, text + "tagType = " + std::to_string(tagType_));
+  DebugReport(kDiagnosticModule, __LINE__, 0, text + "tagType = " + std::to_string(tagType_));
   (VELLUM_DEBUG(0) << text << "context = ").Append(static_cast<const void*>(GetContext())).Process();
 }
 
@@ -319,7 +321,7 @@ TagType TDRTagBase::GetTagType() const {
 void TDRTagBase::SetComparisonFunc(TagComparisonFunc func) {
   const TagComparisonFunc old = gComparisonFunc.exchange(func);
   if (old != nullptr && func != nullptr) {
-    DebugReport(__FILE__, __LINE__, 2, "Redefining comparison function in TDRTagBase::SetComparisonFunc");
+    DebugReport(kDiagnosticModule, __LINE__, 2, "Redefining comparison function in TDRTagBase::SetComparisonFunc");
   }
 }
 
@@ -419,7 +421,7 @@ int32_t WriteEmptyUserData(TDDataWriter* writer) {
 
 int32_t ReadEmptyUserData(TDDataReader* reader) {
   if (gUserDataDepth >= kMaxTypeNestingDepth) {
-    DebugReport(__FILE__, __LINE__, 2, "Type string refused: nesting deeper than 256 levels");
+    DebugReport(kDiagnosticModule, __LINE__, 2, "Type string refused: nesting deeper than 256 levels");
     reader->SetError(kStatusCorruptData);
     return kStatusCorruptData;
   }
@@ -432,7 +434,7 @@ int32_t ReadEmptyUserData(TDDataReader* reader) {
   --gUserDataDepth;
   if (reader->GetError() != kStatusNoError) return reader->GetError();
   if ((type && type.GetTypeCode() != static_cast<int16_t>(TypeCode::Void)) || attributes != 0) {
-    DebugReport(__FILE__, __LINE__, 2, "Tag user data other than the empty variant cannot be read yet");
+    DebugReport(kDiagnosticModule, __LINE__, 2, "Tag user data other than the empty variant cannot be read yet");
     reader->SetError(kStatusCorruptData);
     return kStatusCorruptData;
   }

@@ -12,6 +12,8 @@
 #include "source/CoreTDTable.h"
 #include "source/TD80ReadWrite.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDUnits");
+
 namespace {
 
 constexpr TDBaseUnits kSmallestPolymorphicKey = -9;

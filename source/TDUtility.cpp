@@ -15,6 +15,8 @@
 #include "vellum/TDSimpleHandles.h"
 #include "vellum/TDStringHandles.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDUtility");
+
 namespace {
 
 template <class T>
@@ -88,7 +90,7 @@ std::string ValueToString(const TDR& type, const void* data) {
 int32_t BoundedOrFixedArrayType(const TDR& array) {
   const TDRArray type(array.GetImpPtr(), 1);
   if (!type) {
-    DebugReport(__FILE__, __LINE__, 4, "Bad array");
+    DebugReport(kDiagnosticModule, __LINE__, 4, "Bad array");
     return static_cast<int32_t>(0x80000000u);
   }
   return type.BoundedOrFixed();

@@ -19,6 +19,8 @@
 #include "source/TDCluster.h"
 #include "source/TDNumeric.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TDUtilityCompare");
+
 namespace {
 
 // Data without a path yet holds null, which flattens as not-a-path, and so compares as one.
@@ -184,7 +186,7 @@ int32_t CompareRefnum(const TDImp& refnum, const void* a, const void* b, int32_t
   if (bytewise != 0) return BlockCmp(a, b, size);
   if (size == sizeof(uint64_t)) return Order(Load<uint64_t>(a), Load<uint64_t>(b));
   if (size == sizeof(uint32_t)) return Order(Load<uint32_t>(a), Load<uint32_t>(b));
-  DebugReport(__FILE__, __LINE__, 3, "Unsupported refnum size in CompareDataTDR.");
+  DebugReport(kDiagnosticModule, __LINE__, 3, "Unsupported refnum size in CompareDataTDR.");
   return 0;
 }
 
@@ -217,7 +219,7 @@ int32_t CompareImp(const TDImp& type, bool nullFirst, const void* a, const void*
       return ComparePathData(Load<Path>(a), Load<Path>(b));
     case TypeCode::SubString:
     case TypeCode::SubArray:
-      DebugReport(__FILE__, __LINE__, 3, "CompareData for subtypes should be implemented correctly.");
+      DebugReport(kDiagnosticModule, __LINE__, 3, "CompareData for subtypes should be implemented correctly.");
       return BlockCmp(a, b, SizeOf(type));
     case TypeCode::Array:
       if (const TDArrayBaseImp* array = AsArrayBase(&type)) {

@@ -8,6 +8,8 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXTypes.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TMTypeList");
+
 namespace {
 
 // The array grows by a fixed step: lists are built once per file and rarely grow much past it.
@@ -17,7 +19,7 @@ constexpr size_t kGrowthStep = 100;
 // data, typedef links do not either.
 constexpr int32_t kShareCmpOptions = 0x8000241;
 
-void ReportMissing(const char* text) { DebugReport(__FILE__, __LINE__, 2, text); }
+void ReportMissing(const char* text) { DebugReport(kDiagnosticModule, __LINE__, 2, text); }
 
 }  // namespace
 
@@ -33,12 +35,12 @@ TMTypeList::SlotsPtr TMTypeList::NewSlots() {
 }
 
 TMTypeList::TMTypeList() : list_(NewSlots()) {
-  if (!list_) DebugReport(__FILE__, __LINE__, 2, "Couldn't initialize type list!");
+  if (!list_) DebugReport(kDiagnosticModule, __LINE__, 2, "Couldn't initialize type list!");
 }
 
 TMTypeList::TMTypeList(const TMTypeList& other) : list_(NewSlots()), freeHint_(other.freeHint_) {
   if (!list_) {
-    DebugReport(__FILE__, __LINE__, 2, "Couldn't initialize type list!");
+    DebugReport(kDiagnosticModule, __LINE__, 2, "Couldn't initialize type list!");
     return;
   }
   if (other.list_) {
@@ -81,7 +83,7 @@ int32_t TMTypeList::InsertType(const TDR& type, uint32_t* index) {
   const int32_t slot = FindNullType();
   if (slot < 0) {
     if (AppendType(type, index) == kStatusNoError) return kStatusNoError;
-    DebugReport(__FILE__, __LINE__, 2, "Failed to insert the type.");
+    DebugReport(kDiagnosticModule, __LINE__, 2, "Failed to insert the type.");
     return kStatusNullHandle;
   }
   (*list_)[static_cast<size_t>(slot)] = type;

@@ -12,6 +12,8 @@
 #include "source/CoreTDTable.h"
 #include "source/TDAttributes.h"
 
+VELLUM_DIAGNOSTIC_MODULE("TypeManager");
+
 namespace {
 
 std::array<std::atomic<TDTypeFactory*>, 256> gFactories{};
@@ -136,11 +138,11 @@ TDImpPtr TDTypeFactory::CreateUnflattenHandler(int16_t) const { return TDImpPtr(
 
 void RegisterTypeFactory(uint16_t typeCode, TDTypeFactory* factory) {
   if (typeCode > 255) {
-    DebugReport(__FILE__, __LINE__, 3, "Registering an invalid type factory");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "Registering an invalid type factory");
     return;
   }
   if (gFactories[typeCode].load(std::memory_order_acquire) != nullptr) {
-    DebugReport(__FILE__, __LINE__, 3, "Reregistering a type factory");
+    DebugReport(kDiagnosticModule, __LINE__, 3, "Reregistering a type factory");
   }
   gFactories[typeCode].store(factory, std::memory_order_release);
 }

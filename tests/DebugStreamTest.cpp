@@ -10,6 +10,8 @@
 
 #include "TestSupport.h"
 
+VELLUM_DIAGNOSTIC_MODULE("DebugStreamTest");
+
 namespace {
 
 struct Widget {

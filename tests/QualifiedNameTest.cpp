@@ -142,7 +142,7 @@ TEST(QualifiedNameTest, FromDelimitedNameWithSanityCheck) {
 
 TEST(QualifiedNameTest, ToDebugStream) {
   DebugCapture capture;
-  (VELLUM_DEBUG(0) << Make({"a", "b"})).Process();
+  (DebugStream("QualifiedNameTest", 1, 0) << Make({"a", "b"})).Process();
   ASSERT_EQ(capture.Messages().size(), 1u);
   EXPECT_EQ(capture.Messages()[0].text, "[QualifiedName \"a:b]");
 }

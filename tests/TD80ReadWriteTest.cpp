@@ -112,6 +112,34 @@ TEST_F(TD80ReadWriteTest, TypedefLinkPrecedesTheCodeWord) {
             "00 00 00 01 00 18 00 F1 01 02 03 04 00 00 00 01 06 61 62 63 64 65 66 00 08 00 03 00 00 01 00 00");
 }
 
+TEST_F(TD80ReadWriteTest, TypedefsOfVersionsBeforeQualifiedNamesHoldOneName) {
+  // Only the file name travels, in a PStr padded to even length, and reads back as the one name.
+  TDWInt32 linked;
+  ASSERT_EQ(linked.SetTypedef(Link("abcdef", 0x01020304)), kStatusNoError);
+  const std::string flat = Flat(linked.CheckIn(), 0x08006000);
+  EXPECT_EQ(flat, "00 00 00 01 00 14 00 F1 01 02 03 04 06 61 62 63 64 65 66 00 00 04 00 03 00 01 00 00");
+  TDR back;
+  ASSERT_EQ(Load(BytesFromHex(flat), &back, 0x08006000), kStatusNoError);
+  EXPECT_EQ(back, linked.CheckIn());
+}
+
+TEST_F(TD80ReadWriteTest, KindsNewerThanTheVersionAreNeitherSavedNorLoaded) {
+  TDWAlignmentMarker marker;
+  ASSERT_EQ(marker.SetAlignmentSource(GetiL()), kStatusNoError);
+  const TDR type = marker.CheckIn();
+  DebugCapture capture;
+  EXPECT_EQ(Flat(type, 0x08601FFF), "status 42");
+  EXPECT_TRUE(capture.Contains("Invalid type write"));
+  // What the first version with markers writes is refused by a reader of the version before.
+  const std::vector<uint8_t> bytes = BytesFromHex(Flat(type, 0x08602000));
+  TDR back;
+  EXPECT_EQ(Load(bytes, &back, 0x08601FFF), kStatusOutOfMemory);
+  EXPECT_FALSE(back);
+  EXPECT_TRUE(capture.Contains("Type string refused: type code 101 did not exist in version 0x08601fff"));
+  ASSERT_EQ(Load(bytes, &back, 0x08602000), kStatusNoError);
+  EXPECT_EQ(back, type);
+}
+
 TEST_F(TD80ReadWriteTest, CodeWordFlags) {
   TDWInt32 flagged;
   flagged.SetNoSelectMask(1);
