@@ -15,8 +15,8 @@
 #include "runtime/PXApp.h"
 #include "runtime/PXServices.h"
 #include "runtime/PXStrings.h"
-#include "source/KoDataReader.h"
-#include "source/KoDataWriter.h"
+#include "source/streams/KoDataReader.h"
+#include "source/streams/KoDataWriter.h"
 #include "vellum.h"
 
 namespace {

@@ -11,8 +11,8 @@
 #include "runtime/DebugStream.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXServices.h"
-#include "source/KoDataReader.h"
-#include "source/KoDataWriter.h"
+#include "source/streams/KoDataReader.h"
+#include "source/streams/KoDataWriter.h"
 #include "vellum.h"
 
 namespace {

@@ -7,9 +7,9 @@
 
 #include "runtime/BinData.h"
 #include "runtime/DebugStream.h"
-#include "source/KoDataReader.h"
-#include "source/KoDataWriter.h"
-#include "source/QualifiedName.h"
+#include "source/streams/KoDataReader.h"
+#include "source/streams/KoDataWriter.h"
+#include "source/model/QualifiedName.h"
 
 namespace {
 

@@ -8,10 +8,10 @@
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
 #include "runtime/DebugStream.h"
-#include "source/TD80ReadWrite.h"
-#include "source/TDEnum.h"
-#include "source/TDRefCountedPtr.h"
-#include "source/TDUnits.h"
+#include "source/persistence/TD80ReadWrite.h"
+#include "source/families/TDEnum.h"
+#include "source/model/TDRefCountedPtr.h"
+#include "source/families/TDUnits.h"
 
 namespace {
 

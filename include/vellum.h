@@ -3,6 +3,7 @@
 
 #include "vellum/QualifiedName.h"
 #include "vellum/QXLStr.h"
+#include "vellum/DataStreams.h"
 #include "vellum/TDArrayHandles.h"
 #include "vellum/TDAttributeHandles.h"
 #include "vellum/TDBlockHandles.h"
@@ -24,3 +25,4 @@
 #include "vellum/TypeManagerHooks.h"
 #include "vellum/TypeNotation.h"
 #include "vellum/TypeStrings.h"
+#include "vellum/Versions.h"

@@ -1,6 +1,6 @@
 // The interning dictionaries, their registry, the recursive-types table and garbage collection
 // with its log line, including check-in and collection from many threads at once.
-#include "source/CoreTDTable.h"
+#include "source/model/CoreTDTable.h"
 
 #include <gtest/gtest.h>
 
@@ -15,10 +15,10 @@
 #include <utility>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/PXConfig.h"
-#include "source/TDAttributes.h"
+#include "source/model/TDAttributes.h"
 #include "vellum.h"
 
 namespace {

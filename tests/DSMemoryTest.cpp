@@ -7,7 +7,7 @@
 #include <thread>
 #include <vector>
 
-#include "TestSupport.h"
+#include "support/TestSupport.h"
 
 namespace {
 

@@ -8,7 +8,7 @@
 #include <thread>
 #include <vector>
 
-#include "TestSupport.h"
+#include "support/TestSupport.h"
 
 VELLUM_DIAGNOSTIC_MODULE("DebugStreamTest");
 

@@ -12,7 +12,7 @@
 #include <vector>
 
 #include "FixedPoint/fxp.h"
-#include "FixedPoint/oracle/FxpOracle.h"
+#include "support/oracle/FxpOracle.h"
 
 namespace vellum {
 namespace {

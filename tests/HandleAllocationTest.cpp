@@ -6,7 +6,7 @@
 
 #include <cstring>
 
-#include "TestSupport.h"
+#include "support/TestSupport.h"
 #include "runtime/DSMemory.h"
 
 namespace {

@@ -1,6 +1,6 @@
 // The vellum tool's JSON view of values: every kind read from JSON, flattened, read back and shown
 // again; the refusals of JSON that does not fit its type; and seeded random types and values.
-#include "tools/JsonView.h"
+#include "JsonView.h"
 
 #include <gtest/gtest.h>
 
@@ -11,13 +11,13 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/PXApp.h"
 #include "runtime/PXNumbers.h"
-#include "source/KoDataReader.h"
-#include "source/KoDataWriter.h"
-#include "tools/HexText.h"
+#include "source/streams/KoDataReader.h"
+#include "source/streams/KoDataWriter.h"
+#include "HexText.h"
 #include "vellum.h"
 
 namespace {

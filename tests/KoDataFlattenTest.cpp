@@ -10,16 +10,16 @@
 #include <string>
 #include <vector>
 
-#include "RandomTypes.h"
-#include "TestDatum.h"
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/RandomTypes.h"
+#include "support/TestDatum.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXApp.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
-#include "source/KoDataReader.h"
-#include "source/KoDataWriter.h"
+#include "source/streams/KoDataReader.h"
+#include "source/streams/KoDataWriter.h"
 #include "vellum.h"
 
 namespace {

@@ -6,12 +6,12 @@
 #include <optional>
 #include <vector>
 
-#include "TestSupport.h"
+#include "support/TestSupport.h"
 #include "runtime/BinData.h"
 #include "runtime/PXApp.h"
-#include "source/KoDataReader.h"
-#include "source/KoDataWriter.h"
-#include "source/TD80ReadWrite.h"
+#include "source/streams/KoDataReader.h"
+#include "source/streams/KoDataWriter.h"
+#include "source/persistence/TD80ReadWrite.h"
 
 namespace {
 

@@ -8,7 +8,7 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
+#include "support/TestSupport.h"
 #include "runtime/BinData.h"
 #include "runtime/PXStrings.h"
 

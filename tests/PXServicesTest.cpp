@@ -11,7 +11,7 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
+#include "support/TestSupport.h"
 #include "runtime/KoExcept.h"
 #include "runtime/PXApp.h"
 #include "runtime/PlacementDelete.h"

@@ -6,10 +6,10 @@
 #include <string>
 #include <utility>
 
-#include "TestSupport.h"
+#include "support/TestSupport.h"
 #include "runtime/DSMemory.h"
 #include "runtime/PXStrings.h"
-#include "source/QXLStr.h"
+#include "source/model/QXLStr.h"
 #include "vellum/QXLStr.h"
 
 namespace {

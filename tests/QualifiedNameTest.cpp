@@ -6,13 +6,13 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
+#include "support/TestSupport.h"
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
 #include "runtime/PXStrings.h"
-#include "source/KoDataReader.h"
-#include "source/KoDataWriter.h"
-#include "source/QualifiedName.h"
+#include "source/streams/KoDataReader.h"
+#include "source/streams/KoDataWriter.h"
+#include "source/model/QualifiedName.h"
 #include "vellum/QualifiedName.h"
 
 namespace {

@@ -13,16 +13,16 @@
 #include <string>
 #include <vector>
 
-#include "TestDatum.h"
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestDatum.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXApp.h"
 #include "runtime/PXResources.h"
-#include "source/KoDataReader.h"
-#include "source/TD80ReadWrite.h"
+#include "source/streams/KoDataReader.h"
+#include "source/persistence/TD80ReadWrite.h"
 #include "runtime/PXStrings.h"
-#include "source/CoreTDTable.h"
+#include "source/model/CoreTDTable.h"
 #include "vellum.h"
 #include "vellum/TypeStrings.h"
 

@@ -1,14 +1,14 @@
 // Alignment markers: their alignment with and without a platform, their place in a cluster's
 // layout, the inheritance of a parent cluster's alignment, the handles and conversion.
-#include "source/TDAlignmentMarker.h"
+#include "source/families/TDAlignmentMarker.h"
 
 #include <gtest/gtest.h>
 
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/PXNumbers.h"
 #include "vellum.h"
 

@@ -2,7 +2,7 @@
 // alignment table, copy (flat, element by element, preallocated, into the other Boolean width),
 // conversion along the row-major walk, views into subarrays and back, verification of damaged
 // blocks, compatibility, identity, the shared vectors, and allocation failures.
-#include "source/TDArray.h"
+#include "source/families/TDArray.h"
 
 #include <gtest/gtest.h>
 
@@ -10,13 +10,13 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
-#include "source/TDDataManager.h"
-#include "source/TypeManager.h"
+#include "source/model/TDDataManager.h"
+#include "source/model/TypeManager.h"
 #include "vellum.h"
 
 namespace {

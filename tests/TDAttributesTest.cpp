@@ -1,6 +1,6 @@
 // Names and typedef links: the string hash, interning through their handles, check-out and
 // clone, the 255-byte limit, setters and their dump lines.
-#include "source/TDAttributes.h"
+#include "source/model/TDAttributes.h"
 
 #include <gtest/gtest.h>
 
@@ -8,8 +8,8 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/PXPath.h"
 #include "runtime/PXStrings.h"
 #include "vellum.h"

@@ -1,7 +1,7 @@
 // Blocks: the factories' defaults, layout with and without a platform, the handles' setters,
 // identity and order, the data of repeated blocks (handles inside included), conversion with its
 // refusals, and the registered subarray record clusters.
-#include "source/TDBlock.h"
+#include "source/families/TDBlock.h"
 
 #include <gtest/gtest.h>
 
@@ -9,12 +9,12 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
-#include "source/TypeManager.h"
+#include "source/model/TypeManager.h"
 #include "vellum.h"
 
 namespace {

@@ -3,7 +3,7 @@
 // block, element by element, into the other Boolean width), conversion, compatibility, the error
 // and empty clusters, allocation failures, and a seeded random walk over nested clusters and
 // arrays that checks every handle is given back.
-#include "source/TDCluster.h"
+#include "source/families/TDCluster.h"
 
 #include <gtest/gtest.h>
 
@@ -14,14 +14,14 @@
 #include <string>
 #include <vector>
 
-#include "RandomTypes.h"
-#include "TestDatum.h"
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/RandomTypes.h"
+#include "support/TestDatum.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
-#include "source/TDDataManager.h"
+#include "source/model/TDDataManager.h"
 #include "vellum.h"
 
 namespace {

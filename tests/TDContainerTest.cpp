@@ -2,7 +2,7 @@
 // and single elements, the `<<` chain and its breaking, traversal with replacement (also inside
 // interned containers), ephemeral marking and the Boolean mutation passed to elements, order,
 // lossless conversion, allocation failures and concurrent check-in.
-#include "source/TDContainer.h"
+#include "source/families/TDContainer.h"
 
 #include <gtest/gtest.h>
 
@@ -10,8 +10,8 @@
 #include <thread>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "vellum.h"
 
 namespace {

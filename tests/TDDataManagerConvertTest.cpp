@@ -7,10 +7,10 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/PXStrings.h"
-#include "source/TDDataManager.h"
+#include "source/model/TDDataManager.h"
 #include "vellum.h"
 
 namespace {

@@ -10,11 +10,11 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
-#include "source/TDDataManager.h"
+#include "source/model/TDDataManager.h"
 #include "vellum.h"
 
 namespace {

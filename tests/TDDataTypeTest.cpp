@@ -1,6 +1,6 @@
 // Handles: admission, check-in, check-out and clone, the common setters, allocation failure on
 // the way in, traversal and the walks built on it.
-#include "source/TDDataType.h"
+#include "source/model/TDDataType.h"
 
 #include <gtest/gtest.h>
 
@@ -8,11 +8,11 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/DSMemory.h"
 #include "runtime/PXPath.h"
-#include "source/CoreTDTable.h"
+#include "source/model/CoreTDTable.h"
 #include "vellum.h"
 
 namespace {

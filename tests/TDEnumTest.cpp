@@ -8,12 +8,12 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
-#include "source/TD80ReadWrite.h"
-#include "source/TDEnum.h"
+#include "source/persistence/TD80ReadWrite.h"
+#include "source/families/TDEnum.h"
 #include "vellum.h"
 
 namespace {

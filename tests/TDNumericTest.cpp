@@ -14,14 +14,14 @@
 #include <thread>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
 #include "runtime/PXNumbers.h"
-#include "source/TD80ReadWrite.h"
-#include "source/TDNumeric.h"
-#include "source/TypeManager.h"
+#include "source/persistence/TD80ReadWrite.h"
+#include "source/families/TDNumeric.h"
+#include "source/model/TypeManager.h"
 #include "vellum.h"
 
 namespace {

@@ -1,15 +1,15 @@
 // The plain pointer kinds: CStr, PStr, Ptr and PtrTo: kinds, layout, the copies refused for
 // caller-owned strings, pointer copies, their factories and the absence of shared defaults.
-#include "source/TDOther.h"
+#include "source/families/TDOther.h"
 
 #include <gtest/gtest.h>
 
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
-#include "source/TypeManager.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
+#include "source/model/TypeManager.h"
 #include "vellum.h"
 
 namespace {

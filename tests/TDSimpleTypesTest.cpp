@@ -1,6 +1,6 @@
 // Void and the two Booleans: their kinds, shared defaults, the event-discard mask, the mutation
 // between the Boolean kinds and the visitor entries.
-#include "source/TDSimpleTypes.h"
+#include "source/families/TDSimpleTypes.h"
 
 #include <gtest/gtest.h>
 
@@ -8,8 +8,8 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "vellum.h"
 
 namespace {

@@ -1,7 +1,7 @@
 // Strings, substrings, paths and pictures: kinds and identity, the exact default blocks, the copy
 // routines at their edges, copy and conversion between the kinds, compatibility, verification
 // of damaged handles, the life cycle of data and allocation failures.
-#include "source/TDStringBase.h"
+#include "source/families/TDStringBase.h"
 
 #include <gtest/gtest.h>
 
@@ -10,8 +10,8 @@
 #include <string_view>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"

@@ -1,14 +1,14 @@
 // Tags: kinds, identity by kind, context and class, the guard on the user-defined kind, the
 // comparison hook, compatibility with strings and the order of tag descriptors.
-#include "source/TDTagBase.h"
+#include "source/families/TDTagBase.h"
 
 #include <gtest/gtest.h>
 
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/PXStrings.h"
 #include "vellum.h"
 

@@ -1,6 +1,6 @@
 // The descriptor object: interning identity (hash and equality), flags, type compatibility, the
 // debug dump, the short type text and the shared defaults by code.
-#include "source/TD.h"
+#include "source/model/TD.h"
 
 #include <gtest/gtest.h>
 
@@ -8,8 +8,8 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/PXPath.h"
 #include "vellum.h"
 

@@ -2,7 +2,7 @@
 // exact paths, arrays by count, dimension words and elements (null-first, bytewise, packed
 // Booleans), clusters with and without padding, blocks, subtypes, registered comparisons, the
 // string hashes, and a seeded check that the order is reflexive and antisymmetric.
-#include "source/TDUtilityCompare.h"
+#include "source/operations/TDUtilityCompare.h"
 
 #include <gtest/gtest.h>
 
@@ -15,9 +15,9 @@
 #include <string>
 #include <vector>
 
-#include "TestDatum.h"
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestDatum.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"

@@ -1,13 +1,13 @@
 // Type utilities: the scalar test, view removal, the context walk and the value text.
-#include "source/TDUtility.h"
+#include "source/operations/TDUtility.h"
 
 #include <gtest/gtest.h>
 
 #include <cstring>
 #include <string>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "vellum.h"
 
 namespace {

@@ -1,13 +1,13 @@
 // Type lists: positions, slot reuse, growth, share groups, copies and the missing-list failures.
-#include "source/TMTypeList.h"
+#include "source/persistence/TMTypeList.h"
 
 #include <gtest/gtest.h>
 
 #include <cstdint>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "vellum.h"
 
 namespace {

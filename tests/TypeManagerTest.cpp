@@ -1,6 +1,6 @@
 // The factory table, the type manager service's start and stop, the registry of shared global
 // descriptors and the host's hooks.
-#include "source/TypeManager.h"
+#include "source/model/TypeManager.h"
 
 #include <gtest/gtest.h>
 
@@ -10,10 +10,10 @@
 #include <thread>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "FixedPoint/fxp.h"
-#include "source/CoreTDTable.h"
+#include "source/model/CoreTDTable.h"
 #include "vellum.h"
 
 namespace {

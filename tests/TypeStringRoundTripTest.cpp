@@ -8,9 +8,9 @@
 #include <string>
 #include <vector>
 
-#include "TestDatum.h"
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestDatum.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "runtime/PXApp.h"
 #include "vellum.h"
 #include "vellum/TypeStrings.h"

@@ -1,6 +1,6 @@
 // The textual type notation: the writer's vocabulary, the parser's grammar and its failures, the
 // nesting limit, truncated text, and writing then parsing random descriptor trees.
-#include "source/basicTypeInterpreter.h"
+#include "source/notation/basicTypeInterpreter.h"
 
 #include <gtest/gtest.h>
 
@@ -11,8 +11,8 @@
 #include <string>
 #include <vector>
 
-#include "TestSupport.h"
-#include "TypeSystemFixture.h"
+#include "support/TestSupport.h"
+#include "support/TypeSystemFixture.h"
 #include "vellum.h"
 
 namespace {

@@ -1,6 +1,6 @@
 // Bytes written as hex text, the way the vellum tool prints them and reads them back, on the
 // command line and inside JSON values alike.
-#include "tools/HexText.h"
+#include "HexText.h"
 
 #include <cstdio>
 

@@ -1,6 +1,6 @@
 // The JSON view of typed values: how the vellum tool shows a datum of any type and reads one
 // back. It lives with the tool, not the library: JSON is a way of showing data, not a stored form.
-#include "tools/JsonView.h"
+#include "JsonView.h"
 
 #include <algorithm>
 #include <cctype>
@@ -20,7 +20,7 @@
 #include "runtime/PXNumbers.h"
 #include "runtime/PXPath.h"
 #include "runtime/PXStrings.h"
-#include "tools/HexText.h"
+#include "HexText.h"
 #include "vellum.h"
 
 JsonViewError::JsonViewError(const std::string& reason) : std::runtime_error(reason), reason_(reason), text_(reason) {}

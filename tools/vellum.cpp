@@ -18,10 +18,10 @@
 #include "runtime/DebugStream.h"
 #include "runtime/KoExcept.h"
 #include "runtime/PXApp.h"
-#include "source/KoDataReader.h"
-#include "source/KoDataWriter.h"
-#include "tools/HexText.h"
-#include "tools/JsonView.h"
+#include "source/streams/KoDataReader.h"
+#include "source/streams/KoDataWriter.h"
+#include "HexText.h"
+#include "JsonView.h"
 #include "vellum.h"
 
 namespace {

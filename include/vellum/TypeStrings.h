@@ -6,12 +6,10 @@
 
 #include "runtime/BinData.h"
 #include "runtime/PXTypes.h"
-#include "source/KoCMutate.h"
-#include "source/KoDataWriter.h"
+#include "vellum/DataStreams.h"
 #include "vellum/TDHandles.h"
 #include "vellum/TMTypeList.h"
-
-class KoDataReader;
+#include "vellum/Versions.h"
 
 // What a type string may describe. A load refuses, with status 2 and a message naming the limit,
 // a descriptor nested deeper than kMaxTypeNestingDepth levels (every recursive walk over a

@@ -1,6 +1,0 @@
-// Type utilities: small questions about descriptors, the value text, and the shared error
-// cluster.
-#pragma once
-
-#include "source/TD.h"
-#include "vellum/TDUtility.h"

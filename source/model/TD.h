@@ -1,0 +1,218 @@
+// The descriptor object every kind derives from: its flags, its cached hash and equality (what
+// interning rests on), the virtual interface in slot order, the kind predicates, traversal and dump.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+#include <string>
+
+#include "runtime/DebugStream.h"
+#include "source/model/TDRefCountedPtr.h"
+#include "vellum/TDHandles.h"
+#include "vellum/TDLayout.h"
+#include "vellum/TypeCodes.h"
+
+class TDDataWriter;
+class TDDataReader;
+class KoDataWriter;
+class KoDataReader;
+class FlatDataCacheHelper;
+class HandleAllocationInterface;
+
+// Flag bits of a descriptor.
+constexpr uint32_t kTDFlagReadOnly = 0x0001;       // the interned copy; never changes again
+constexpr uint32_t kTDFlagEventDiscard = 0x0002;   // Boolean event-discard mask
+constexpr uint32_t kTDFlagEphemeral = 0x0004;
+constexpr uint32_t kTDFlagNoSelect = 0x0008;
+constexpr uint32_t kTDFlagRecursiveMark = 0x0010;  // garbage collection's mark, not identity
+constexpr uint32_t kTDFlagGeneric = 0x2000;
+constexpr uint32_t kTDFlagColumnVector = 0x4000;
+
+// The flag bits that take part in hash and equality: the read-only bit says where an object
+// lives, and the collection's mark is bookkeeping set on interned objects while others may look
+// them up, so neither may change what type an object is.
+constexpr uint32_t kTDIdentityFlagsMask = ~(kTDFlagReadOnly | kTDFlagRecursiveMark);
+
+// Result bits of type compatibility (CmpTD).
+constexpr int32_t kCmpMinor = 0x1;
+constexpr int32_t kCmpNeedsConversion = 0x10;
+constexpr int32_t kCmpTypedefDiffers = 0x20;
+constexpr int32_t kCmpEnumDiffers = 0x80;
+constexpr int32_t kCmpIncompatible = 0x100;
+constexpr int32_t kCmpUnitsDiffer = 0x800;
+constexpr int32_t kCmpNamesDiffer = 0x8000;
+constexpr int32_t kCmpMayLoseInformation = 0x80000;
+
+// Flags of CmpTD.
+constexpr int32_t kCmpFlagCompareNames = 0x1;
+constexpr int32_t kCmpFlagCompareNamesDeep = 0x2;
+constexpr int32_t kCmpFlagTypedefIncompatible = 0x4;
+constexpr int32_t kCmpFlagIgnoreTypedefs = 0x8;
+constexpr int32_t kCmpFlagCompareFlagWords = 0x40;
+// Numbers: a refnum cookie may go into a UInt32 or UInt64, an enumeration into a plain number.
+constexpr int32_t kCmpFlagLooseNumbers = 0x100;
+constexpr int32_t kCmpFlagTypedefBit = 0x400;
+constexpr int32_t kCmpFlagReportLoss = 0x2000;
+// Numbers: units may be dropped or added where one side has none.
+constexpr int32_t kCmpFlagIgnoreMissingUnits = 0x4000;
+constexpr int32_t kCmpFlagIgnoreTimeStamps = 0x8000;
+constexpr int32_t kCmpFlagDropLinksIfAny = 0x40000;
+// Numbers: destination units with a polymorphic unit accept any units.
+constexpr int32_t kCmpFlagPolyUnitsMatchAny = 0x80000;
+constexpr int32_t kCmpFlagSecondPass = 0x100000;
+// Numbers: an enumeration may go into a plain number.
+constexpr int32_t kCmpFlagEnumIntoPlain = 0x800000;
+constexpr int32_t kCmpFlagGenericMatters = 0x8000000;
+constexpr int32_t kCmpFlagEphemeralMatters = 0x10000000;
+
+// One traversal step's callbacks. `replacement` starts null; a visitor that fills it asks the
+// container to put that descriptor in place of the visited one.
+using TDVisitFn = TDTraverseValue (*)(TDImp* td, void* context, TDImpPtr* replacement);
+using TDShouldRecurseFn = bool (*)(TDImp* td, void* context);
+
+class TDImp : public TDRefCountedHashedObj {
+ public:
+  ~TDImp() override;
+
+  // --- slots 1 to 41 ---------------------------------------------------------------------------
+  int32_t GetHashValue() const override;
+  int32_t ComputeHashValue() const override;
+  virtual int16_t GetTypeCode() const = 0;
+  virtual int32_t GetFlatSizeForSaving(int32_t* size, TDDataWriter* writer, int32_t* index) const;
+  virtual int32_t IsSameAs(const TDImp& other) const;
+  // A new, empty object of the same class: null name and typedef, flags 0, default members.
+  virtual TDImpPtr NewInstance() const = 0;
+  // Fill `target` (fresh from NewInstance) with writable copies of this object's members.
+  // 0, or 2 when a copy cannot be allocated.
+  virtual int32_t MemberCloneOrCheckOut(TDImpPtr& target) const;
+  // Fill `target` with interned copies of this object's members and mark it read-only.
+  // 0, or 2 when a member cannot be interned.
+  virtual int32_t MemberCheckIn(TDImpPtr& target) const;
+  virtual int32_t HasEnum() const { return 0; }
+  virtual int32_t HasUnits() const { return 0; }
+  virtual int32_t EphemeralizeTD(int32_t queryOnly);
+  virtual int32_t UnephemeralizeTD(int32_t queryOnly);
+  virtual int32_t FlattenTDForSaving(TDDataWriter* writer, int32_t* index) const;
+  virtual int32_t FlattenTDPartsForSaving(TDDataWriter*) const { return 0; }
+  virtual int32_t ConstructTD(TDDataReader* reader);
+  virtual int32_t ConvertTDIndicesToTDImpPtrs(FlatDataCacheHelper*) const { return 0; }
+  virtual int32_t VerifyData(const void*, const KoContext*) const { return 0; }
+  virtual int32_t DataSizeCore(ITargetPlatformAlignment* platform) const = 0;
+  virtual int32_t GetAlignment(ITargetPlatformAlignment* platform) const;
+  virtual int64_t AlignDatumCore(int64_t offset, ITargetPlatformAlignment* platform) const;
+  virtual int32_t DefinedType(int32_t) const { return 1; }
+  virtual int32_t InflateDefData(void* data, int32_t onlyIfEmpty, int32_t clearFirst, int32_t flags) const;
+  virtual int32_t DeflateData(void*, void*, int32_t, const HandleAllocationInterface&) const { return 0; }
+  virtual DataShapes DataShapeOf(int32_t inMemory) const;
+  virtual int32_t ShrinkData(void*, void*, int32_t, const HandleAllocationInterface&) const { return 0; }
+  virtual uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const;
+  virtual int32_t IsFlatDataFixedSize() const { return 0; }
+  virtual int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const;
+  virtual int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const;
+  virtual int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const;
+  virtual bool CopyDataConvertDestOverride(const TDImp*, const void*, void*, int32_t, int32_t&) const {
+    return false;
+  }
+  virtual int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const;
+  virtual int32_t ResetToDefaultData(void* data) const;
+  virtual int32_t CompareClassData(int32_t, const void*, const TDImp*, TDImp**) const { return 0; }
+  virtual int32_t MutateBooleanTD(TDImpPtr*, int32_t) { return 0; }
+  virtual void Accept(ITDVisitor* visitor);
+  virtual void PrintDebugStr(const uint8_t* prefix) const;
+  virtual int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const;
+  virtual bool CmpTDOverride(const TDImp*, int32_t, int32_t&) const { return false; }
+  virtual int32_t CompareForSorting(const TDImp*) const { return 0; }
+  virtual bool ConversionIsLossless(const TDImp* dst) const;
+
+  // --- slots 42 to 173: the kind predicates ----------------------------------------------------
+#define VELLUM_TD_DECLARE_SLOT(name) \
+  virtual int32_t name() const { return 0; }
+  VELLUM_TD_PREDICATES_FIRST(VELLUM_TD_DECLARE_SLOT)
+  virtual int32_t IsErrorCluster(int32_t) const { return 0; }
+  VELLUM_TD_PREDICATES_SECOND(VELLUM_TD_DECLARE_SLOT)
+  virtual int32_t IsGeneric() const { return (Flags() & kTDFlagGeneric) != 0 ? 1 : 0; }
+  VELLUM_TD_PREDICATES_THIRD(VELLUM_TD_DECLARE_SLOT)
+#undef VELLUM_TD_DECLARE_SLOT
+
+  // --- slots 174 to 178 ------------------------------------------------------------------------
+  // Visits this descriptor (a -1 answer becomes 0); containers then walk their elements.
+  virtual TDTraverseValue TraverseTD(TDVisitFn visit, void* context, TDShouldRecurseFn shouldRecurse,
+                                     TDImpPtr* replacement);
+  virtual const KoContext* GetContext() const { return nullptr; }
+  virtual void SetContext(const KoContext*) { ClearHashValid(); }
+  virtual void SetGenericness(int32_t generic);
+  virtual bool HoldsContext() const { return false; }
+
+  // --- what the loaders and walks learn of a tree ----------------------------------------------
+  // Depth and expanded count from the elements' own (1 and 1 for a descriptor without any).
+  virtual void ComputeNesting(uint32_t* depth, uint32_t* count) const;
+
+  // --- non-virtual members ---------------------------------------------------------------------
+  // The interned equal object (made and inserted when absent); null when memory runs out.
+  TDImpPtr CheckIn() const;
+  // Always a new writable copy; null when memory runs out.
+  TDImpPtr CloneOrCheckOut() const;
+
+  int32_t IsReadOnlyTD() const { return (Flags() & kTDFlagReadOnly) != 0 ? 1 : 0; }
+  uint32_t Flags() const noexcept { return flags_.load(std::memory_order_relaxed); }
+  // Flag changes; the caller decides whether the change is one of identity (ClearHashValid).
+  void SetFlags(uint32_t flags) noexcept { flags_.store(flags, std::memory_order_relaxed); }
+  void SetFlagBits(uint32_t bits) noexcept { flags_.fetch_or(bits, std::memory_order_relaxed); }
+  void ClearFlagBits(uint32_t bits) noexcept { flags_.fetch_and(~bits, std::memory_order_relaxed); }
+
+  const TDNameImpPtr& GetNameImpPtr() const noexcept { return name_; }
+  const TDTypedefImpPtr& GetTypedefImpPtr() const noexcept { return typedef_; }
+  void SetNameImpPtr(const TDNameImpPtr& name);
+  void SetTypedefImpPtr(const TDTypedefImpPtr& typedefLink);
+
+  int32_t CmpTDCommon(const TDImp* other, int32_t flags) const;
+
+  // How many levels this descriptor's tree has (1 for one without elements) and how many
+  // descriptors the tree holds when each is counted every time it occurs (saturating). Kept by
+  // interned objects from their check-in, so constant time for them; the loaders' limits and
+  // every recursive walk rely on them.
+  uint32_t NestingDepth() const;
+  uint32_t ExpandedCount() const;
+
+  // The code word of this descriptor's record in a type string of `version`: the code with the
+  // flag bits of the record.
+  uint16_t RecordCodeWord(uint32_t version) const;
+
+ protected:
+  TDImp() noexcept = default;
+  TDImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink) noexcept;
+
+ private:
+  TDNameImpPtr name_;
+  TDTypedefImpPtr typedef_;
+  std::atomic<uint32_t> flags_{0};
+  // Cached nesting of an interned object; 0 until known.
+  mutable std::atomic<uint32_t> depth_{0};
+  mutable std::atomic<uint32_t> expanded_{0};
+};
+
+// What the descriptor dictionary calls to match interned descriptors.
+inline bool InternEqual(const TDImp& a, const TDImp& b) { return a.IsSameAs(b) != 0; }
+// Descriptors carry their own read-only flag, set by check-in before insertion.
+inline void MarkInterned(TDImp&) {}
+
+// A read-only handle on an interned descriptor; for code that has the object in hand.
+inline TDR TDRFromImp(const TDImpPtr& imp) { return TDR(imp, 1); }
+
+// Zeroes the in-place bytes of one datum of `type` when `clear` is nonzero.
+void TDImpClearMemory(void* data, const TDImp* type, int32_t clear);
+
+// Appends `[TD "name"]` to the stream.
+void ToDebugStream(DebugStream& stream, const TD& type);
+
+namespace vellum::detail {
+extern std::atomic<int32_t> gDSAlign;
+}  // namespace vellum::detail
+
+// The running process's largest alignment (SetDSAlign); 0, packed, until the host sets it.
+// Inline: every layout question and every cluster copy asks it.
+inline int32_t GetDSAlign() { return vellum::detail::gDSAlign.load(std::memory_order_relaxed); }
+
+// Writes the record of `type` (and first those of every descriptor it needs) unless the writer's
+// save table holds an equal one, and gives its save-table index.
+int32_t SaveTDRecord(const TDImp* type, TDDataWriter* writer, uint32_t* index);

@@ -1,0 +1,79 @@
+// Type factories by code, the type manager service with its start and stop sequences, the
+// registry of shared global descriptors released at stop, and the host's procedure hooks.
+#pragma once
+
+#include <atomic>
+#include <cstdint>
+
+#include "source/model/TD.h"
+#include "vellum/TypeManagerHooks.h"
+
+// Makes empty descriptors of one kind while saved types are read. Stateless; one object per
+// kind in static storage, never freed.
+class TDTypeFactory {
+ public:
+  virtual ~TDTypeFactory();
+  // A new, writable, empty descriptor of the kind about to be filled by its ConstructTD; null
+  // with *status set when it cannot be made.
+  virtual TDImpPtr CreateTD(TDDataReader* reader, uint16_t typeCode, int32_t* status) const = 0;
+  // A descriptor that can stand for data of this code when only the code is known.
+  virtual TDImpPtr CreateUnflattenHandler(int16_t typeCode) const;
+};
+
+// The factory of a kind whose descriptors start empty and are filled by their ConstructTD.
+template <class Imp>
+class EmptyTypeFactory final : public TDTypeFactory {
+ public:
+  TDImpPtr CreateTD(TDDataReader*, uint16_t, int32_t* status) const override {
+    TDImpPtr type = MakeCounted<Imp>();
+    if (status != nullptr) *status = type ? kStatusNoError : kStatusOutOfMemory;
+    return type;
+  }
+};
+
+// Stores a factory for a code (0 to 255; others are refused with a message). Replacing one
+// reports the re-registration and goes on.
+void RegisterTypeFactory(uint16_t typeCode, TDTypeFactory* factory);
+// The factory of a code, or null (also for codes outside 0..255).
+TDTypeFactory* GetTypeFactory(int32_t typeCode);
+// The code's factory's stand-in descriptor, or null when no factory is registered.
+TDImpPtr CreateUnflattenHandler(int16_t typeCode);
+
+// Each family announces, as it loads, the factories the service registers at start; `order`
+// is the factory's place in the registration sequence.
+void AnnounceTypeFactory(int32_t order, uint16_t typeCode, TDTypeFactory* factory);
+
+// Each family announces the getter of its shared default descriptor per code.
+using DefaultTypeGetter = const TDR& (*)();
+void RegisterDefaultTypeGetter(int32_t code, DefaultTypeGetter getter);
+bool HasDefaultTypeGetter(int32_t code);
+
+// A static slot for one shared descriptor, released when the service stops.
+struct GlobalTypeEntry {
+  TDR td;
+  std::atomic<bool> set{false};
+  GlobalTypeEntry* next = nullptr;
+};
+
+// Under "RegisterMutex": the first registration of an entry wins; later ones change nothing.
+void TDRegisterType(GlobalTypeEntry* entry, const TDR& td);
+int32_t GetNumRegisteredTypes();
+
+// The shared descriptor held by `entry`, built on first use by checking in `make()`. Builders
+// on several threads all obtain the same interned object. The null `TDR` when memory runs out.
+const TDR& SharedGlobalType(GlobalTypeEntry& entry, TDImpPtr (*make)());
+
+// What the library consults of the host's hooks.
+TDSanityCheckProc GetTDSanityCheckProc();
+CompleteDataSizeProc GetCompleteDataSizeProc();
+EventToEventTypeEnumProc GetEventToEventTypeEnumProc();
+FindRefObjTDRProc GetFindRefObjTDRProc();
+GDataDispatchTableFactoryProc GetGDataDispatchTableFactoryProc();
+StatusMapProc GetHResultToMgErrProc();
+StatusMapProc GetMgErrToHResultProc();
+OleVariantUnFlattenDataProc GetOleVariantUnFlattenDataProc();
+TypeToShortStringProc GetTypeToShortStringProc();
+bool IsCoerceFromKoVariantEnabled();
+bool IsFlatTypeCacheEnabled();
+bool IsPreAllocationEnabled();
+bool AreRecursiveTypesEnabled();
