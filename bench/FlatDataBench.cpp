@@ -15,8 +15,7 @@
 #include "runtime/PXApp.h"
 #include "runtime/PXServices.h"
 #include "runtime/PXStrings.h"
-#include "source/streams/KoDataReader.h"
-#include "source/streams/KoDataWriter.h"
+#include "vellum/DataStreams.h"
 #include "vellum.h"
 
 namespace {

@@ -11,8 +11,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXServices.h"
-#include "source/streams/KoDataReader.h"
-#include "source/streams/KoDataWriter.h"
+#include "vellum/DataStreams.h"
 #include "vellum.h"
 
 namespace {

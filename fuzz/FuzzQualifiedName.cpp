@@ -7,9 +7,8 @@
 
 #include "runtime/BinData.h"
 #include "runtime/DebugStream.h"
-#include "source/streams/KoDataReader.h"
-#include "source/streams/KoDataWriter.h"
-#include "source/model/QualifiedName.h"
+#include "vellum/DataStreams.h"
+#include "vellum/QualifiedName.h"
 
 namespace {
 

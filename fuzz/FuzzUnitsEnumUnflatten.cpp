@@ -8,10 +8,9 @@
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
 #include "runtime/DebugStream.h"
-#include "source/persistence/TD80ReadWrite.h"
-#include "source/families/TDEnum.h"
-#include "source/model/TDRefCountedPtr.h"
-#include "source/families/TDUnits.h"
+#include "vellum/TypeStrings.h"
+#include "vellum/TDEnumHandles.h"
+#include "vellum/TDUnitsHandles.h"
 
 namespace {
 

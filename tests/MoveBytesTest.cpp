@@ -1,6 +1,6 @@
 // The short byte moves of the copy paths: every length and overlap against memmove, and the
 // same-length variable string move taking only the case it can finish alone.
-#include "source/model/MoveBytes.h"
+#include "runtime/MoveBytes.h"
 
 #include <gtest/gtest.h>
 

@@ -9,7 +9,6 @@
 #include "support/TestSupport.h"
 #include "runtime/DSMemory.h"
 #include "runtime/PXStrings.h"
-#include "source/model/QXLStr.h"
 #include "vellum/QXLStr.h"
 
 namespace {

@@ -10,9 +10,7 @@
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
 #include "runtime/PXStrings.h"
-#include "source/streams/KoDataReader.h"
-#include "source/streams/KoDataWriter.h"
-#include "source/model/QualifiedName.h"
+#include "vellum/DataStreams.h"
 #include "vellum/QualifiedName.h"
 
 namespace {

@@ -19,12 +19,11 @@
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXApp.h"
 #include "runtime/PXResources.h"
-#include "source/streams/KoDataReader.h"
-#include "source/persistence/TD80ReadWrite.h"
-#include "runtime/PXStrings.h"
-#include "source/model/CoreTDTable.h"
-#include "vellum.h"
+#include "vellum/DataStreams.h"
 #include "vellum/TypeStrings.h"
+#include "runtime/PXStrings.h"
+#include "vellum/Dictionaries.h"
+#include "vellum.h"
 
 namespace {
 
@@ -544,7 +543,7 @@ struct InternedCounts {
 
 InternedCounts CollectAndCount() {
   GarbageCollectDictionaries();
-  return {GTDDictionary().Size(), TheNameDictionary().Size()};
+  return {DictionarySize("TD"), DictionarySize("Name")};
 }
 
 struct LimitCase {
@@ -577,8 +576,8 @@ TEST_F(TD80ReadWriteTest, StringsBeyondTheLimitsAreRefusedAndLeaveNothingBehind)
     EXPECT_EQ(capture.Texts(), std::vector<std::string>{c.message});
     // The complete records were interned and nothing of the refused one: not even its name,
     // which no other record uses.
-    EXPECT_EQ(GTDDictionary().Size(), before.types + c.completeRecords);
-    EXPECT_EQ(TheNameDictionary().Size(), before.names + 1);
+    EXPECT_EQ(DictionarySize("TD"), before.types + c.completeRecords);
+    EXPECT_EQ(DictionarySize("Name"), before.names + 1);
     EXPECT_EQ(CollectAndCount(), before);
   }
 }

@@ -1,6 +1,6 @@
 // Alignment markers: their alignment with and without a platform, their place in a cluster's
 // layout, the inheritance of a parent cluster's alignment, the handles and conversion.
-#include "source/families/TDAlignmentMarker.h"
+#include "vellum/TDBlockHandles.h"
 
 #include <gtest/gtest.h>
 

@@ -2,7 +2,7 @@
 // alignment table, copy (flat, element by element, preallocated, into the other Boolean width),
 // conversion along the row-major walk, views into subarrays and back, verification of damaged
 // blocks, compatibility, identity, the shared vectors, and allocation failures.
-#include "source/families/TDArray.h"
+#include "vellum/TDArrayHandles.h"
 
 #include <gtest/gtest.h>
 
@@ -15,8 +15,8 @@
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
-#include "source/model/TDDataManager.h"
-#include "source/model/TypeManager.h"
+#include "vellum/TDFlags.h"
+#include "vellum/TypeManagerHooks.h"
 #include "vellum.h"
 
 namespace {

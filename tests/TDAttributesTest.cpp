@@ -1,6 +1,6 @@
 // Names and typedef links: the string hash, interning through their handles, check-out and
 // clone, the 255-byte limit, setters and their dump lines.
-#include "source/model/TDAttributes.h"
+#include "vellum/TDAttributeHandles.h"
 
 #include <gtest/gtest.h>
 

@@ -1,7 +1,7 @@
 // Blocks: the factories' defaults, layout with and without a platform, the handles' setters,
 // identity and order, the data of repeated blocks (handles inside included), conversion with its
 // refusals, and the registered subarray record clusters.
-#include "source/families/TDBlock.h"
+#include "vellum/TDBlockHandles.h"
 
 #include <gtest/gtest.h>
 
@@ -14,7 +14,7 @@
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
-#include "source/model/TypeManager.h"
+#include "vellum/TypeManagerHooks.h"
 #include "vellum.h"
 
 namespace {

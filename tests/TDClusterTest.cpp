@@ -3,7 +3,7 @@
 // block, element by element, into the other Boolean width), conversion, compatibility, the error
 // and empty clusters, allocation failures, and a seeded random walk over nested clusters and
 // arrays that checks every handle is given back.
-#include "source/families/TDCluster.h"
+#include "vellum/TDContainerHandles.h"
 
 #include <gtest/gtest.h>
 
@@ -21,7 +21,7 @@
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
-#include "source/model/TDDataManager.h"
+#include "vellum/TDFlags.h"
 #include "vellum.h"
 
 namespace {

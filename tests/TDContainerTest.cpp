@@ -2,7 +2,7 @@
 // and single elements, the `<<` chain and its breaking, traversal with replacement (also inside
 // interned containers), ephemeral marking and the Boolean mutation passed to elements, order,
 // lossless conversion, allocation failures and concurrent check-in.
-#include "source/families/TDContainer.h"
+#include "vellum/TDContainerHandles.h"
 
 #include <gtest/gtest.h>
 

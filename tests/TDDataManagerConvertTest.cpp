@@ -10,7 +10,7 @@
 #include "support/TestSupport.h"
 #include "support/TypeSystemFixture.h"
 #include "runtime/PXStrings.h"
-#include "source/model/TDDataManager.h"
+#include "vellum/TDFlags.h"
 #include "vellum.h"
 
 namespace {

@@ -14,7 +14,7 @@
 #include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
-#include "source/model/TDDataManager.h"
+#include "vellum/TDFlags.h"
 #include "vellum.h"
 
 namespace {

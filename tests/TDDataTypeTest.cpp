@@ -1,6 +1,6 @@
 // Handles: admission, check-in, check-out and clone, the common setters, allocation failure on
 // the way in, traversal and the walks built on it.
-#include "source/model/TDDataType.h"
+#include "vellum/TDHandles.h"
 
 #include <gtest/gtest.h>
 
@@ -12,7 +12,7 @@
 #include "support/TypeSystemFixture.h"
 #include "runtime/DSMemory.h"
 #include "runtime/PXPath.h"
-#include "source/model/CoreTDTable.h"
+#include "vellum/Dictionaries.h"
 #include "vellum.h"
 
 namespace {
@@ -272,7 +272,7 @@ TEST_F(TDDataTypeTest, CheckInUnderAllocationFailureGivesNullAndLeaksNothing) {
   ASSERT_EQ(type.SetNoSelectMask(1), kStatusNoError);
   ASSERT_TRUE(type.CheckIn()) << "the dictionaries get their tables on first use and keep them";
   const int64_t settled = SettledBlockCount();
-  const uint32_t interned = GTDDictionary().Size();
+  const uint32_t interned = DictionarySize("TD");
   bool succeeded = false;
   for (int64_t n = 1; n <= kSweepLimit && !succeeded; ++n) {
     SCOPED_TRACE(n);
@@ -285,7 +285,7 @@ TEST_F(TDDataTypeTest, CheckInUnderAllocationFailureGivesNullAndLeaksNothing) {
     }
     if (fired) {
       EXPECT_TRUE(result.IsNull());
-      EXPECT_EQ(GTDDictionary().Size(), interned) << "nothing half-built is interned";
+      EXPECT_EQ(DictionarySize("TD"), interned) << "nothing half-built is interned";
     } else {
       ASSERT_TRUE(result);
       EXPECT_EQ(result.IsSameAs(type), 1);

@@ -12,8 +12,8 @@
 #include "support/TypeSystemFixture.h"
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
-#include "source/persistence/TD80ReadWrite.h"
-#include "source/families/TDEnum.h"
+#include "vellum/TypeStrings.h"
+#include "vellum/TDEnumHandles.h"
 #include "vellum.h"
 
 namespace {

@@ -19,9 +19,9 @@
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
 #include "runtime/PXNumbers.h"
-#include "source/persistence/TD80ReadWrite.h"
-#include "source/families/TDNumeric.h"
-#include "source/model/TypeManager.h"
+#include "vellum/TypeStrings.h"
+#include "vellum/TDNumericHandles.h"
+#include "vellum/TypeManagerHooks.h"
 #include "vellum.h"
 
 namespace {

@@ -1,6 +1,6 @@
 // The plain pointer kinds: CStr, PStr, Ptr and PtrTo: kinds, layout, the copies refused for
 // caller-owned strings, pointer copies, their factories and the absence of shared defaults.
-#include "source/families/TDOther.h"
+#include "vellum/TDOtherHandles.h"
 
 #include <gtest/gtest.h>
 
@@ -9,7 +9,7 @@
 
 #include "support/TestSupport.h"
 #include "support/TypeSystemFixture.h"
-#include "source/model/TypeManager.h"
+#include "vellum/TypeManagerHooks.h"
 #include "vellum.h"
 
 namespace {

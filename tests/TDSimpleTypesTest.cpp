@@ -1,6 +1,6 @@
 // Void and the two Booleans: their kinds, shared defaults, the event-discard mask, the mutation
 // between the Boolean kinds and the visitor entries.
-#include "source/families/TDSimpleTypes.h"
+#include "vellum/TDSimpleHandles.h"
 
 #include <gtest/gtest.h>
 

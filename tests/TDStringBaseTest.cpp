@@ -1,7 +1,7 @@
 // Strings, substrings, paths and pictures: kinds and identity, the exact default blocks, the copy
 // routines at their edges, copy and conversion between the kinds, compatibility, verification
 // of damaged handles, the life cycle of data and allocation failures.
-#include "source/families/TDStringBase.h"
+#include "vellum/TDStringHandles.h"
 
 #include <gtest/gtest.h>
 

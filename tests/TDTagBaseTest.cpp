@@ -1,6 +1,6 @@
 // Tags: kinds, identity by kind, context and class, the guard on the user-defined kind, the
 // comparison hook, compatibility with strings and the order of tag descriptors.
-#include "source/families/TDTagBase.h"
+#include "vellum/TDTagHandles.h"
 
 #include <gtest/gtest.h>
 

@@ -1,6 +1,6 @@
 // The descriptor object: interning identity (hash and equality), flags, type compatibility, the
 // debug dump, the short type text and the shared defaults by code.
-#include "source/model/TD.h"
+#include "vellum/TDHandles.h"
 
 #include <gtest/gtest.h>
 

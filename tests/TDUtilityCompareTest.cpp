@@ -2,7 +2,7 @@
 // exact paths, arrays by count, dimension words and elements (null-first, bytewise, packed
 // Booleans), clusters with and without padding, blocks, subtypes, registered comparisons, the
 // string hashes, and a seeded check that the order is reflexive and antisymmetric.
-#include "source/operations/TDUtilityCompare.h"
+#include "vellum/TDCompare.h"
 
 #include <gtest/gtest.h>
 

@@ -1,5 +1,5 @@
 // Type utilities: the scalar test, view removal, the context walk and the value text.
-#include "source/operations/TDUtility.h"
+#include "vellum/TDUtility.h"
 
 #include <gtest/gtest.h>
 

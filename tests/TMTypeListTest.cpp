@@ -1,5 +1,5 @@
 // Type lists: positions, slot reuse, growth, share groups, copies and the missing-list failures.
-#include "source/persistence/TMTypeList.h"
+#include "vellum/TMTypeList.h"
 
 #include <gtest/gtest.h>
 

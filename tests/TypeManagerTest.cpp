@@ -1,6 +1,6 @@
 // The factory table, the type manager service's start and stop, the registry of shared global
 // descriptors and the host's hooks.
-#include "source/model/TypeManager.h"
+#include "vellum/TypeManagerHooks.h"
 
 #include <gtest/gtest.h>
 
@@ -13,7 +13,7 @@
 #include "support/TestSupport.h"
 #include "support/TypeSystemFixture.h"
 #include "FixedPoint/fxp.h"
-#include "source/model/CoreTDTable.h"
+#include "vellum/Dictionaries.h"
 #include "vellum.h"
 
 namespace {

@@ -1,6 +1,6 @@
 // The textual type notation: the writer's vocabulary, the parser's grammar and its failures, the
 // nesting limit, truncated text, and writing then parsing random descriptor trees.
-#include "source/notation/basicTypeInterpreter.h"
+#include "vellum/TypeNotation.h"
 
 #include <gtest/gtest.h>
 

@@ -32,6 +32,10 @@ struct RepeatedBlockKind {
   static bool Admit(const TDImp& type);
   static TDImpPtr New(const uint8_t* name);
 };
+// The target platform (ITargetPlatformAlignment::PlatformIdentifier) on which an alignment marker
+// still aligns as its source; on every other platform a marker aligns to 1.
+constexpr uint32_t kAlignmentSourcePlatformId = 0x34367877;
+
 struct AlignmentMarkerKind {
   static bool Admit(const TDImp& type);
   static TDImpPtr New(const uint8_t* name);

@@ -6,6 +6,7 @@
 #include <string>
 #include <type_traits>
 
+#include "vellum/TDFlags.h"
 #include "vellum/TDLayout.h"
 #include "vellum/TDPredicates.h"
 #include "vellum/TypeCodes.h"
@@ -152,6 +153,9 @@ class TD {
   // Type compatibility of data of `other`'s type going into this type: 0 the same for data
   // purposes, otherwise the result bits. The same object (or both null) is 0, one null 0x100.
   int32_t CmpTD(const TD& other, int32_t flags) const;
+  // A total order of descriptors for sorting them: null first, then by type code, then by the
+  // kind's own order (sizes, bounds, elements, ...); 0 for the same type.
+  int32_t CompareForSorting(const TD& other) const;
 
   // Writes the descriptor dump to the debug stream (level 0); always 0.
   int32_t PrintDebugStr(const uint8_t* prefix) const;

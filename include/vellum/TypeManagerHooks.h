@@ -11,11 +11,32 @@
 #include "vellum/TDHandles.h"
 
 class KoDataReader;
+class TDDataReader;
 class GDataDispatchTable;
 
 // The single type manager service ("TypeManager"). The host starts it on one thread, after the
 // memory, path and atomic-operations services, and stops it with no other use in progress.
 IServiceObject* TypeManagerService();
+
+// Makes empty descriptors of one kind while saved types are read. Stateless; one object per
+// kind in static storage, never freed.
+class TDTypeFactory {
+ public:
+  virtual ~TDTypeFactory();
+  // A new, writable, empty descriptor of the kind about to be filled by its ConstructTD; null
+  // with *status set when it cannot be made.
+  virtual TDImpPtr CreateTD(TDDataReader* reader, uint16_t typeCode, int32_t* status) const = 0;
+  // A descriptor that can stand for data of this code when only the code is known.
+  virtual TDImpPtr CreateUnflattenHandler(int16_t typeCode) const;
+};
+
+// Stores a factory for a code (0 to 255; others are refused with a message). Replacing one
+// reports the re-registration and goes on.
+void RegisterTypeFactory(uint16_t typeCode, TDTypeFactory* factory);
+// The factory of a code, or null (also for codes outside 0..255).
+TDTypeFactory* GetTypeFactory(int32_t typeCode);
+// The code's factory's stand-in descriptor, or null when no factory is registered.
+TDImpPtr CreateUnflattenHandler(int16_t typeCode);
 
 // One collection of every registered dictionary; logs its timing at level 1 when the
 // configuration key "vellum.garbageCollection.logging" is set.

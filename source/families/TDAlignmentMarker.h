@@ -7,8 +7,6 @@
 #include "source/families/TDContainer.h"
 #include "vellum/TDBlockHandles.h"
 
-// The target platform on which an alignment marker still aligns as its source.
-constexpr uint32_t kAlignmentSourcePlatformId = 0x34367877;
 
 class TDAlignmentMarkerImp final : public TDSingleContainerImp {
  public:

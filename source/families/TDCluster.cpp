@@ -16,7 +16,7 @@
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXStrings.h"
 #include "source/families/TDStringBase.h"
-#include "source/model/MoveBytes.h"
+#include "runtime/MoveBytes.h"
 #include "source/model/TDAttributes.h"
 #include "source/model/TDDataManager.h"
 #include "source/model/TypeManager.h"

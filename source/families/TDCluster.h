@@ -9,8 +9,6 @@
 
 #include "source/families/TDContainer.h"
 
-// CmpTD result bit: the cluster element counts differ.
-constexpr int32_t kCmpEltCountsDiffer = 0x1000;
 
 class TDClusterImp : public TDMultiContainerImp {
  public:

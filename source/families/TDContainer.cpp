@@ -391,14 +391,6 @@ const TDMultiContainerImp* AsMultiContainer(const TDImp* type) {
                                                            : nullptr;
 }
 
-int32_t CompareEltsForSorting(const TDImp* a, const TDImp* b) {
-  if (a == b) return 0;
-  if (a == nullptr || b == nullptr) return a == nullptr ? -1 : 1;
-  const int32_t codes = static_cast<int32_t>(a->GetTypeCode()) - static_cast<int32_t>(b->GetTypeCode());
-  if (codes != 0) return codes;
-  return a->CompareForSorting(b);
-}
-
 // --- handles -------------------------------------------------------------------------------------
 
 bool ContainerKind::Admit(const TDImp& type) { return type.IsContainer() != 0; }

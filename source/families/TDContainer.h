@@ -148,9 +148,6 @@ namespace vellum::detail {
 bool AppendInChain(TDWMultiContainer& container, const TD& element);
 }  // namespace vellum::detail
 
-// The order of two element descriptors: an absent one first, then by type code, then by the
-// kind's own order.
-int32_t CompareEltsForSorting(const TDImp* a, const TDImp* b);
 
 // The save-table index of an element whose record is already written, as a VSF; 42 when it
 // is missing from the table.

@@ -7,14 +7,6 @@
 #include "source/model/TD.h"
 #include "vellum/TDStringHandles.h"
 
-// CmpTD result bits of the string family: data of a String (0x2) or a SubString (0xA) meets a
-// tag, and sizes, bounds or kinds differ (0x8). A caller passing flag 0x10 asks for no 0x8 where
-// only the sizes differ.
-constexpr int32_t kCmpStringMeetsTag = 0x2;
-constexpr int32_t kCmpStringSizesDiffer = 0x8;
-constexpr int32_t kCmpSubStringMeetsTag = 0xA;
-constexpr int32_t kCmpFlagNoStringSizeBits = 0x10;
-
 // Every string-like kind with a bound word. Its own data behaviour is that of a counted string in
 // a handle (String, Pict, Tag); SubString and Path change what they hold.
 class TDStringBaseImp : public TDImp {

@@ -12,20 +12,10 @@
 #include "runtime/PXMutex.h"
 #include "runtime/PXTypes.h"
 #include "source/model/TDRefCountedPtr.h"
+#include "vellum/Dictionaries.h"
 
 class TDEventRegOMIdInfoImp;
 class TDIVISubTypeImp;
-
-class ITDDictionary {
- public:
-  virtual uint32_t Size() const = 0;
-  // Removes every object that only the dictionary still references.
-  virtual void Purge() = 0;
-  virtual const char* Name() const = 0;
-  // Removes every object.
-  virtual void Empty() = 0;
-  virtual ~ITDDictionary();
-};
 
 // Holds interned objects keyed by their hash; equal objects (`InternEqual`, which must be
 // visible where Find or Insert is used, as must `MarkInterned`) are kept once. Each dictionary has its own mutex, held
@@ -151,11 +141,6 @@ EventRegOMIdInfoDictionary& TheEventRegOMIdInfoDictionary();
 IVISubTypeDictionary& TheIVISubTypeDictionary();
 OMIdDictionary& TheOMIdDictionary();
 
-// The registry the collection walks; the service fills it at start and clears it at stop.
-constexpr int32_t kMaxDictionaries = 10;
-void RegisterDictionary(ITDDictionary* dictionary);
-ITDDictionary* const* GetTDDictionaries();
-int32_t GetNumDictionaries();
 // Empties every registered dictionary in registration order and clears the registry.
 void EmptyRegisteredDictionaries();
 
@@ -163,14 +148,6 @@ void EmptyRegisteredDictionaries();
 // 0, or 2 when it cannot be allocated.
 int32_t CreateRecursiveTypesTable();
 void DestroyRecursiveTypesTable();
-bool HasRecursiveTypesTable();
-// 0; 42 without a table; 1 for a null descriptor; 2 when memory runs out.
-int32_t InsertRecursiveTypeIntoTable(const TDR& type);
-int32_t RecursiveTypesTableSize();
-
-// The first collection reads the logging key and keeps it; this makes the next one read it again
-// (for a host, or a test, that changed the configuration).
-void ResetCollectionLoggingSetting();
 
 // The flattened-type cache's part in collection (entries removed and visited) and at stop.
 using FlatTypeCacheCollectFn = void (*)(uint32_t* removed, uint32_t* visited);

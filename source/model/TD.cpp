@@ -591,3 +591,11 @@ int32_t SaveTDRecord(const TDImp* type, TDDataWriter* writer, uint32_t* index) {
   }
   return kStatusNoError;
 }
+
+int32_t CompareEltsForSorting(const TDImp* a, const TDImp* b) {
+  if (a == b) return 0;
+  if (a == nullptr || b == nullptr) return a == nullptr ? -1 : 1;
+  const int32_t codes = static_cast<int32_t>(a->GetTypeCode()) - static_cast<int32_t>(b->GetTypeCode());
+  if (codes != 0) return codes;
+  return a->CompareForSorting(b);
+}

@@ -33,38 +33,6 @@ constexpr uint32_t kTDFlagColumnVector = 0x4000;
 // them up, so neither may change what type an object is.
 constexpr uint32_t kTDIdentityFlagsMask = ~(kTDFlagReadOnly | kTDFlagRecursiveMark);
 
-// Result bits of type compatibility (CmpTD).
-constexpr int32_t kCmpMinor = 0x1;
-constexpr int32_t kCmpNeedsConversion = 0x10;
-constexpr int32_t kCmpTypedefDiffers = 0x20;
-constexpr int32_t kCmpEnumDiffers = 0x80;
-constexpr int32_t kCmpIncompatible = 0x100;
-constexpr int32_t kCmpUnitsDiffer = 0x800;
-constexpr int32_t kCmpNamesDiffer = 0x8000;
-constexpr int32_t kCmpMayLoseInformation = 0x80000;
-
-// Flags of CmpTD.
-constexpr int32_t kCmpFlagCompareNames = 0x1;
-constexpr int32_t kCmpFlagCompareNamesDeep = 0x2;
-constexpr int32_t kCmpFlagTypedefIncompatible = 0x4;
-constexpr int32_t kCmpFlagIgnoreTypedefs = 0x8;
-constexpr int32_t kCmpFlagCompareFlagWords = 0x40;
-// Numbers: a refnum cookie may go into a UInt32 or UInt64, an enumeration into a plain number.
-constexpr int32_t kCmpFlagLooseNumbers = 0x100;
-constexpr int32_t kCmpFlagTypedefBit = 0x400;
-constexpr int32_t kCmpFlagReportLoss = 0x2000;
-// Numbers: units may be dropped or added where one side has none.
-constexpr int32_t kCmpFlagIgnoreMissingUnits = 0x4000;
-constexpr int32_t kCmpFlagIgnoreTimeStamps = 0x8000;
-constexpr int32_t kCmpFlagDropLinksIfAny = 0x40000;
-// Numbers: destination units with a polymorphic unit accept any units.
-constexpr int32_t kCmpFlagPolyUnitsMatchAny = 0x80000;
-constexpr int32_t kCmpFlagSecondPass = 0x100000;
-// Numbers: an enumeration may go into a plain number.
-constexpr int32_t kCmpFlagEnumIntoPlain = 0x800000;
-constexpr int32_t kCmpFlagGenericMatters = 0x8000000;
-constexpr int32_t kCmpFlagEphemeralMatters = 0x10000000;
-
 // One traversal step's callbacks. `replacement` starts null; a visitor that fills it asks the
 // container to put that descriptor in place of the visited one.
 using TDVisitFn = TDTraverseValue (*)(TDImp* td, void* context, TDImpPtr* replacement);
@@ -216,3 +184,7 @@ inline int32_t GetDSAlign() { return vellum::detail::gDSAlign.load(std::memory_o
 // Writes the record of `type` (and first those of every descriptor it needs) unless the writer's
 // save table holds an equal one, and gives its save-table index.
 int32_t SaveTDRecord(const TDImp* type, TDDataWriter* writer, uint32_t* index);
+
+// The order of two descriptors: an absent one first, then by type code, then by the kind's own
+// order (CompareForSorting).
+int32_t CompareEltsForSorting(const TDImp* a, const TDImp* b);

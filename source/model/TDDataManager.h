@@ -29,18 +29,3 @@ void WriteVerifyDataMessage(int32_t status, const TDImp& type, const void* data,
 // Both: a datum of `type` at `data` failed its check. Returns the status, after the diagnostic
 // when it is nonzero.
 int32_t ReportDamagedData(const TDImp& type, const void* data);
-
-// Flags of a copy. Other bits pass unchanged to element copies and to the families' converters.
-// Arrays and clusters copy into the other Boolean width (Boolean and BooleanU16).
-constexpr int32_t kCopyFlagBooleanForm = 0x1;
-// Cluster-to-cluster conversion skips source elements that are arrays; the bit is removed before
-// the elements are converted.
-constexpr int32_t kCopyFlagSkipArrays = 0x2;
-
-// CmpTD result bits of arrays that converters read (the string family's are in TDStringBase.h,
-// the cluster's in TDCluster.h).
-// A dimension of the destination is fixed, or bounded below the source's size.
-constexpr int32_t kCmpDimensionLimited = 0xA;
-constexpr int32_t kCmpDimsDiffer = 0x200;
-// One side's array element matches the other, non-array side.
-constexpr int32_t kCmpEltMatchesNonArray = 0x400;

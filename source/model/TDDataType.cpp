@@ -171,6 +171,10 @@ int32_t TD::CmpTD(const TD& other, int32_t flags) const {
   return imp_->CmpTDCommon(other.imp_.get(), flags);
 }
 
+int32_t TD::CompareForSorting(const TD& other) const {
+  return CompareEltsForSorting(imp_.get(), other.imp_.get());
+}
+
 int32_t TD::PrintDebugStr(const uint8_t* prefix) const {
   const std::string text = prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
   DebugReport(kDiagnosticModule, __LINE__, 0, text + "TypeDescriptor {");

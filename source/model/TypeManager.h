@@ -8,18 +8,6 @@
 #include "source/model/TD.h"
 #include "vellum/TypeManagerHooks.h"
 
-// Makes empty descriptors of one kind while saved types are read. Stateless; one object per
-// kind in static storage, never freed.
-class TDTypeFactory {
- public:
-  virtual ~TDTypeFactory();
-  // A new, writable, empty descriptor of the kind about to be filled by its ConstructTD; null
-  // with *status set when it cannot be made.
-  virtual TDImpPtr CreateTD(TDDataReader* reader, uint16_t typeCode, int32_t* status) const = 0;
-  // A descriptor that can stand for data of this code when only the code is known.
-  virtual TDImpPtr CreateUnflattenHandler(int16_t typeCode) const;
-};
-
 // The factory of a kind whose descriptors start empty and are filled by their ConstructTD.
 template <class Imp>
 class EmptyTypeFactory final : public TDTypeFactory {
@@ -30,14 +18,6 @@ class EmptyTypeFactory final : public TDTypeFactory {
     return type;
   }
 };
-
-// Stores a factory for a code (0 to 255; others are refused with a message). Replacing one
-// reports the re-registration and goes on.
-void RegisterTypeFactory(uint16_t typeCode, TDTypeFactory* factory);
-// The factory of a code, or null (also for codes outside 0..255).
-TDTypeFactory* GetTypeFactory(int32_t typeCode);
-// The code's factory's stand-in descriptor, or null when no factory is registered.
-TDImpPtr CreateUnflattenHandler(int16_t typeCode);
 
 // Each family announces, as it loads, the factories the service registers at start; `order`
 // is the factory's place in the registration sequence.

@@ -17,7 +17,7 @@
 #include "source/families/TDBlock.h"
 #include "source/families/TDCluster.h"
 #include "source/families/TDNumeric.h"
-#include "source/model/MoveBytes.h"
+#include "runtime/MoveBytes.h"
 
 VELLUM_DIAGNOSTIC_MODULE("TDUtilityCompare");
 

@@ -14,6 +14,7 @@
 
 #include "runtime/DSMemory.h"
 #include "runtime/DebugStream.h"
+#include "vellum/Dictionaries.h"
 
 // Collects every DebugMessage emitted while it lives (from any thread), instead of printing
 // them; restores the default sink when destroyed.
@@ -72,6 +73,15 @@ class LiveBlockCheck {
 
 // Text literals as the byte strings the library's C-string and Pascal-string calls take.
 inline const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
+
+// The number of objects the registered dictionary `name` ("TD", "Name", ...) holds; 0 when no
+// such dictionary is registered (the service is stopped).
+inline uint32_t DictionarySize(std::string_view name) {
+  for (int32_t i = 0; i < GetNumDictionaries(); ++i) {
+    if (GetTDDictionaries()[i]->Name() == name) return GetTDDictionaries()[i]->Size();
+  }
+  return 0;
+}
 
 // Fails the 1st, 2nd, ... allocation of `operation` until it succeeds. Each failure must give
 // `expected` and leave nothing allocated; the run that succeeds must give 0.
