@@ -10,7 +10,6 @@
 
 #include "runtime/DSMemory.h"
 #include "runtime/HandleAllocation.h"
-#include "runtime/PXServices.h"
 #include "runtime/PXStrings.h"
 #include "vellum.h"
 
@@ -21,19 +20,8 @@ constexpr int32_t kArrayElements = 1000000;
 // Longer than any in-place small-string buffer, so the baseline's text lives on the heap too.
 const char kText[] = "a source string of some forty bytes....";
 
-// The type manager service, running for the whole program.
-class Session {
- public:
-  Session() { services_.Start(TypeManagerService()); }
-  ~Session() { services_.StopAll(); }
-  Session(const Session&) = delete;
-  Session& operator=(const Session&) = delete;
-
- private:
-  ServiceManager services_;
-};
-
-void EnsureSession() { static Session session; }
+// The library runs for the whole program.
+void EnsureSession() { static vellum::Session session; }
 
 const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 

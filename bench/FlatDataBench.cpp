@@ -13,7 +13,6 @@
 #include "runtime/DSMemory.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXApp.h"
-#include "runtime/PXServices.h"
 #include "runtime/PXStrings.h"
 #include "vellum/DataStreams.h"
 #include "vellum.h"
@@ -23,18 +22,8 @@ namespace {
 constexpr int32_t kDoubles = 1000000;
 constexpr int32_t kRecords = 100000;
 
-class Session {
- public:
-  Session() { services_.Start(TypeManagerService()); }
-  ~Session() { services_.StopAll(); }
-  Session(const Session&) = delete;
-  Session& operator=(const Session&) = delete;
-
- private:
-  ServiceManager services_;
-};
-
-void EnsureSession() { static Session session; }
+// The library runs for the whole program.
+void EnsureSession() { static vellum::Session session; }
 
 uint64_t Swap64(uint64_t v) { return __builtin_bswap64(v); }
 uint32_t Swap32(uint32_t v) { return __builtin_bswap32(v); }

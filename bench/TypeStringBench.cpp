@@ -8,26 +8,14 @@
 #include <string>
 
 #include "runtime/DSMemory.h"
-#include "runtime/PXServices.h"
 #include "vellum.h"
 
 namespace {
 
 constexpr int kRecords = 1000;
 
-// The type manager service, running for the whole program.
-class Session {
- public:
-  Session() { services_.Start(TypeManagerService()); }
-  ~Session() { services_.StopAll(); }
-  Session(const Session&) = delete;
-  Session& operator=(const Session&) = delete;
-
- private:
-  ServiceManager services_;
-};
-
-void EnsureSession() { static Session session; }
+// The library runs for the whole program.
+void EnsureSession() { static vellum::Session session; }
 
 const uint8_t* U(const char* text) { return reinterpret_cast<const uint8_t*>(text); }
 

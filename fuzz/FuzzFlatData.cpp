@@ -9,8 +9,6 @@
 
 #include "runtime/DSMemory.h"
 #include "runtime/DebugStream.h"
-#include "runtime/HandleAllocation.h"
-#include "runtime/PXServices.h"
 #include "vellum/DataStreams.h"
 #include "vellum.h"
 
@@ -50,27 +48,6 @@ std::vector<TDR> MakeTypes() {
   return types;
 }
 
-// One datum of `type`, inflated, given back when done.
-class Datum {
- public:
-  explicit Datum(const TDR& type) : type_(type), storage_(static_cast<size_t>(type.DataSize()) / 8 + 2, 0) {
-    inflated_ = type_.InflateDefData(storage_.data(), 0, 1, 0) == 0;
-  }
-  ~Datum() {
-    auto* begin = reinterpret_cast<uint8_t*>(storage_.data());
-    type_.DeflateData(begin, begin + storage_.size() * sizeof(uint64_t), 1, NormalHandleAllocator());
-  }
-  Datum(const Datum&) = delete;
-  Datum& operator=(const Datum&) = delete;
-  bool Inflated() const { return inflated_; }
-  void* Data() { return storage_.data(); }
-
- private:
-  TDR type_;
-  std::vector<uint64_t> storage_;
-  bool inflated_ = false;
-};
-
 bool Write(const TDR& type, void* data, uint32_t version, std::vector<uint8_t>* bytes) {
   OutputBuf out;
   KoDataWriter writer(&out, version, nullptr, 0);
@@ -89,13 +66,13 @@ int32_t Read(const TDR& type, const uint8_t* data, size_t size, uint32_t version
 }
 
 void Check(const TDR& type, uint32_t version, const uint8_t* data, size_t size) {
-  Datum first(type);
-  if (!first.Inflated()) return;
+  vellum::Value first(type);
+  if (first.Status() != 0) return;
   size_t left = 0;
   if (Read(type, data, size, version, first.Data(), &left) != 0) return;
   std::vector<uint8_t> written;
   if (!Write(type, first.Data(), version, &written)) return;
-  Datum second(type);
+  vellum::Value second(type);
   if (Read(type, written.data(), written.size(), version, second.Data(), &left) != 0 || left != 0) std::abort();
   std::vector<uint8_t> again;
   if (!Write(type, second.Data(), version, &again) || again != written) std::abort();
@@ -106,8 +83,8 @@ void Check(const TDR& type, uint32_t version, const uint8_t* data, size_t size) 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   static const bool ready = [] {
     SetDebugSink([](const DebugMessage&) {});
-    static ServiceManager services;
-    if (services.Start(TypeManagerService()) != 0) std::abort();
+    static const vellum::Session session;
+    if (session.Status() != 0) std::abort();
     return true;
   }();
   (void)ready;

@@ -6,8 +6,7 @@
 #include <string>
 
 #include "runtime/DSMemory.h"
-#include "runtime/DebugStream.h"
-#include "runtime/PXServices.h"
+#include "support/FreshLibrary.h"
 #include "vellum.h"
 
 namespace {
@@ -57,25 +56,11 @@ void CheckRoundTrip(const std::string& text, IVILinkMediator* linker) {
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  // One start and stop first, so that what lives as long as the process exists before counting.
-  static const bool ready = [] {
-    SetDebugSink([](const DebugMessage&) {});
-    ServiceManager services;
-    if (services.Start(TypeManagerService()) != 0) std::abort();
-    services.StopAll();
-    return true;
-  }();
-  (void)ready;
   const std::string text(reinterpret_cast<const char*>(data), size);
-  const int64_t liveBefore = DSLiveBlockCount();
-  {
-    ServiceManager services;
-    if (services.Start(TypeManagerService()) != 0) std::abort();
+  vellum::fuzz::WithFreshLibrary([&] {
     FixedLinker linker;
     CheckRoundTrip(text, nullptr);
     CheckRoundTrip(text, &linker);
-    services.StopAll();
-  }
-  if (DSLiveBlockCount() != liveBefore) std::abort();
+  });
   return 0;
 }

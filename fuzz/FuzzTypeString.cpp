@@ -8,8 +8,7 @@
 #include <cstring>
 
 #include "runtime/DSMemory.h"
-#include "runtime/DebugStream.h"
-#include "runtime/PXServices.h"
+#include "support/FreshLibrary.h"
 #include "vellum.h"
 
 namespace {
@@ -43,25 +42,11 @@ void CheckRoundTrip(const uint8_t* data, size_t size, uint32_t version, bool ide
 }  // namespace
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  // One start and stop first, so that what lives as long as the process exists before counting.
-  static const bool ready = [] {
-    SetDebugSink([](const DebugMessage&) {});
-    ServiceManager services;
-    if (services.Start(TypeManagerService()) != 0) std::abort();
-    services.StopAll();
-    return true;
-  }();
-  (void)ready;
-  const int64_t liveBefore = DSLiveBlockCount();
-  {
-    ServiceManager services;
-    if (services.Start(TypeManagerService()) != 0) std::abort();
+  vellum::fuzz::WithFreshLibrary([&] {
     CheckRoundTrip(data, size, 0x22308000, true);
     // Flags an old record cannot hold (the generic bit) are read but not written back.
     CheckRoundTrip(data, size, 0x08600000, false);
     CheckRoundTrip(data, size, 0x08006000, false);
-    services.StopAll();
-  }
-  if (DSLiveBlockCount() != liveBefore) std::abort();
+  });
   return 0;
 }

@@ -5,6 +5,7 @@
 #include "vellum/QXLStr.h"
 #include "vellum/DataStreams.h"
 #include "vellum/Dictionaries.h"
+#include "vellum/Host.h"
 #include "vellum/TDArrayHandles.h"
 #include "vellum/TDAttributeHandles.h"
 #include "vellum/TDBlockHandles.h"

@@ -25,7 +25,19 @@ void DefaultSink(const DebugMessage& m) {
   std::fprintf(stderr, "%s(%" PRId32 ") %" PRId32 ": %s\n", m.module.c_str(), m.line, m.level, m.text.c_str());
 }
 
+// The first error-level message of this thread since the record was last cleared: the reason a
+// refused call gives, for hosts that install no sink.
+struct FirstError {
+  bool held = false;
+  DebugMessage message;
+};
+thread_local FirstError tFirstError;
+
 void Emit(const DebugMessage& m) {
+  if (m.level >= 2 && !tFirstError.held) {
+    tFirstError.message = m;
+    tFirstError.held = true;
+  }
   DebugSink sink;
   {
     SinkHolder& h = TheSink();
@@ -50,6 +62,10 @@ void SetDebugSink(DebugSink sink) {
   }
   // `old` is destroyed here, outside the lock: its captures may do anything.
 }
+
+const DebugMessage* FirstDebugError() { return tFirstError.held ? &tFirstError.message : nullptr; }
+
+void ClearFirstDebugError() { tFirstError.held = false; }
 
 std::string DebugModuleName(const char* file) {
   std::string_view path = file ? std::string_view(file) : std::string_view();

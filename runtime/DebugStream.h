@@ -111,6 +111,12 @@ void Forward(DebugStream& s, const T& v) {
 
 #define VELLUM_DEBUG(level) DebugStream(kDiagnosticModule, __LINE__, (level))
 
+// The first error-level message (level 2 or more) written on this thread since the last
+// ClearFirstDebugError(), whatever the sink; null when there is none. The pointer is valid until
+// the thread writes or clears again.
+const DebugMessage* FirstDebugError();
+void ClearFirstDebugError();
+
 // One whole message in one call; `module` as for the DebugStream constructor.
 void DebugReport(const char* module, int32_t line, int32_t level, std::string_view text);
 

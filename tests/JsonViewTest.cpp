@@ -28,7 +28,7 @@ constexpr int32_t Fix(int32_t n) { return vellum::bound::Fixed(n); }
 
 // The flattened data of the value `json` gives, in hex; "error: " and the reason when it is refused.
 std::string Encode(const TDR& type, const JsonValue& json, uint32_t version = PXApp::Instance().GetVersion()) {
-  OwnedDatum datum(type);
+  vellum::Value datum(type);
   EXPECT_EQ(datum.Status(), kStatusNoError);
   try {
     JsonToData(type, json, datum.Data());
@@ -49,7 +49,7 @@ std::string EncodeText(const TDR& type, const std::string& json) { return Encode
 std::string Decode(const TDR& type, const std::string& hex, bool named = false) {
   std::vector<uint8_t> bytes;
   EXPECT_EQ(ParseHex(hex, &bytes), "");
-  OwnedDatum datum(type);
+  vellum::Value datum(type);
   InputBuf in(bytes.data(), bytes.size());
   KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
   const int32_t status = reader.ReadData(type, datum.Data(), 1);
@@ -390,7 +390,7 @@ TEST_F(JsonViewTest, KindsWithoutAViewAreNamed) {
   EXPECT_EQ(JsonViewRefusal(GetSubStringTD()), "SubString values have no JSON view");
   EXPECT_EQ(JsonViewRefusal(Notation("{iL,[1,{S,<1,iL>}]}")), "SubArray values have no JSON view");
   EXPECT_EQ(JsonViewRefusal(Repeated(TDRBooleanU16(), 2)), "BooleanU16 values have no JSON view");
-  OwnedDatum datum{TDRBooleanU16()};
+  vellum::Value datum{TDRBooleanU16()};
   EXPECT_THROW(JsonToData(TDRBooleanU16(), JsonValue(true), datum.Data()), JsonViewError);
   EXPECT_THROW(DataToJson(TDRBooleanU16(), datum.Data(), false), JsonViewError);
 }
@@ -410,7 +410,7 @@ TEST_F(JsonViewTest, AValueRefusedHalfWayLeaksNothing) {
   const TDR type = Cluster({TDRArray(1, GetStringTD()), TDRArray(1, GetPathTD()), GetiB()});
   LiveBlockCheck blocks;
   {
-    OwnedDatum datum(type);
+    vellum::Value datum(type);
     const JsonValue value = JsonValue::parse(
         "[[\"a\",\"b\",\"c\"],[{\"path\":[\"x\"]},{\"path\":[\"y\"]}],1000]");
     EXPECT_THROW(JsonToData(type, value, datum.Data()), JsonViewError);
@@ -586,7 +586,7 @@ TEST_F(JsonViewTest, RandomTypesAndValuesRoundTrip) {
     const bool named = random.Pick(2) == 0;
     SCOPED_TRACE("seed " + std::to_string(seed) + ", round " + std::to_string(round) + ": " +
                  TypeToInterpretedString(type) + " " + value.dump());
-    OwnedDatum first(type);
+    vellum::Value first(type);
     ASSERT_NO_THROW(JsonToData(type, value, first.Data()));
     const JsonValue shown = DataToJson(type, first.Data(), named);
     OutputBuf out;

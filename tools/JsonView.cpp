@@ -906,15 +906,3 @@ uint64_t DefaultDataBytes(const TDR& type) {
 }
 
 // --- owned data ----------------------------------------------------------------------------------
-
-OwnedDatum::OwnedDatum(const TDR& type)
-    : type_(type),
-      storage_((static_cast<size_t>(std::max(type.DataSize(), 0)) + sizeof(std::max_align_t) - 1) /
-                   sizeof(std::max_align_t) +
-               1),
-      status_(type.InflateDefData(Data(), 0, 1, 0)) {}
-
-OwnedDatum::~OwnedDatum() {
-  auto* begin = reinterpret_cast<uint8_t*>(storage_.data());
-  type_.DeflateData(begin, begin + storage_.size() * sizeof(std::max_align_t), 1, NormalHandleAllocator());
-}

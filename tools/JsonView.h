@@ -84,22 +84,3 @@ JsonValue DataToJson(const TDR& type, const void* data, bool named);
 // arrays preallocated). Throws JsonViewError when the value does not fit the type, or memory runs
 // out; `data` is then still a valid datum, partly filled, that its owner disposes of as usual.
 void JsonToData(const TDR& type, const JsonValue& value, void* data);
-
-// One datum of a type in suitably aligned storage of its own: default data from construction,
-// its handles given back on destruction. One thread at a time.
-class OwnedDatum {
- public:
-  explicit OwnedDatum(const TDR& type);
-  ~OwnedDatum();
-  OwnedDatum(const OwnedDatum&) = delete;
-  OwnedDatum& operator=(const OwnedDatum&) = delete;
-  // The status of making the default data: 0, or 2 when memory ran out.
-  int32_t Status() const { return status_; }
-  void* Data() { return storage_.data(); }
-  const void* Data() const { return storage_.data(); }
-
- private:
-  TDR type_;
-  std::vector<std::max_align_t> storage_;
-  int32_t status_;
-};

@@ -13,14 +13,11 @@
 
 #include <CLI/CLI.hpp>
 
-#include "runtime/BinData.h"
-#include "runtime/DSMemory.h"
+#include "HexText.h"
+#include "JsonView.h"
 #include "runtime/DebugStream.h"
 #include "runtime/KoExcept.h"
 #include "runtime/PXApp.h"
-#include "vellum/DataStreams.h"
-#include "HexText.h"
-#include "JsonView.h"
 #include "vellum.h"
 
 namespace {
@@ -35,20 +32,6 @@ constexpr size_t kMaxInputBytes = size_t{64} << 20;
 // The default datum a data command makes, blocks included; a type that needs more is refused before
 // any memory is taken for it (a fixed-size array can ask for gigabytes).
 constexpr uint64_t kMaxDatumBytes = uint64_t{64} << 20;
-
-// Starts the library the way a host does, and stops it when the command is done.
-class LibrarySession {
- public:
-  LibrarySession() : status_(services_.Start(TypeManagerService())) {}
-  ~LibrarySession() { services_.StopAll(); }
-  LibrarySession(const LibrarySession&) = delete;
-  LibrarySession& operator=(const LibrarySession&) = delete;
-  int32_t Status() const { return status_; }
-
- private:
-  ServiceManager services_;
-  int32_t status_;
-};
 
 // Holds the library's diagnostic lines while a command runs, so that the command decides what
 // reaches the terminal: a dump goes to standard output, and a refusal's reason joins the one
@@ -65,8 +48,10 @@ class DiagnosticCapture {
   DiagnosticCapture(const DiagnosticCapture&) = delete;
   DiagnosticCapture& operator=(const DiagnosticCapture&) = delete;
 
-  // The lines collected since the last call.
+  // The lines collected since the last call; the library's record of the reason of a refusal
+  // starts again with them.
   std::vector<DebugMessage> Take() {
+    vellum::ClearRefusal();
     std::lock_guard lock(mutex_);
     return std::exchange(messages_, {});
   }
@@ -75,14 +60,6 @@ class DiagnosticCapture {
   std::mutex mutex_;  // guards messages_
   std::vector<DebugMessage> messages_;
 };
-
-// The first error-level line of `messages` (the cause; later lines are its consequences), or "".
-std::string FirstErrorText(const std::vector<DebugMessage>& messages) {
-  for (const DebugMessage& m : messages) {
-    if (m.level >= 2) return m.text;
-  }
-  return std::string();
-}
 
 // Error-level lines of a command that still succeeded are worth seeing, but never on stdout.
 void PrintWarnings(const std::vector<DebugMessage>& messages) {
@@ -101,27 +78,13 @@ int Fail(int exitStatus, std::string line) {
   return exitStatus;
 }
 
-// A refusal by the library: what failed, its status, and the library's own reason when it gave one.
-int FailWithStatus(const std::string& what, int32_t status, const std::vector<DebugMessage>& messages) {
+// A refusal by the library: what failed, its status, and the library's own reason when it gave one
+// (the first error line: later lines are its consequences).
+int FailWithStatus(const std::string& what, int32_t status) {
   std::string line = what + " (status " + std::to_string(status) + ")";
-  if (const std::string reason = FirstErrorText(messages); !reason.empty()) line += ": " + reason;
+  if (const std::string reason = vellum::LastRefusal(); !reason.empty()) line += ": " + reason;
   return Fail(kExitFailure, std::move(line));
 }
-
-// A handle the library hands out, disposed of when the command is done with it.
-class OwnedHandle {
- public:
-  OwnedHandle() = default;
-  ~OwnedHandle() { DSDisposeHandle(handle_); }
-  OwnedHandle(const OwnedHandle&) = delete;
-  OwnedHandle& operator=(const OwnedHandle&) = delete;
-  UHandle* Out() { return &handle_; }
-  const uint8_t* Data() const { return handle_ != nullptr ? *handle_ : nullptr; }
-  size_t Size() const { return DSGetHandleSize(handle_); }
-
- private:
-  UHandle handle_ = nullptr;
-};
 
 // Reads all of `file` (opened by the caller) up to the cap. "" on success, otherwise the reason.
 std::string ReadAll(std::FILE* file, std::vector<uint8_t>* bytes) {
@@ -195,9 +158,9 @@ int DescribeType(const std::string& text, int32_t align, bool alignGiven, Diagno
   if (alignGiven) SetDSAlign(align);
   TDR type;
   if (int exitStatus = 0; !ParseNotation(text, &type, &exitStatus)) return exitStatus;
-  OwnedHandle flat;
+  vellum::OwnedHandle flat;
   if (const int32_t status = FlattenOneType(nullptr, type, flat.Out(), nullptr); status != 0)
-    return FailWithStatus("cannot write the type string", status, diagnostics.Take());
+    return FailWithStatus("cannot write the type string", status);
   char code[16] = "none";
   if (type) std::snprintf(code, sizeof code, "0x%02X", static_cast<unsigned>(type.GetTypeCode()));
   std::printf("notation: %s\n", TypeToInterpretedString(type).c_str());
@@ -205,7 +168,7 @@ int DescribeType(const std::string& text, int32_t align, bool alignGiven, Diagno
   std::printf("code: %s\n", code);
   std::printf("size: %d\n", type.DataSize());
   std::printf("alignment: %d\n", type.GetAlignment());
-  std::printf("typestring: %s\n", LowerHex(flat.Data(), flat.Size()).c_str());
+  std::printf("typestring: %s\n", LowerHex(flat.Bytes().data(), flat.Bytes().size()).c_str());
   PrintWarnings(diagnostics.Take());
   return 0;
 }
@@ -220,17 +183,17 @@ int EncodeTypes(const std::vector<std::string>& texts, uint32_t version, Diagnos
     if (int exitStatus = 0; !ParseNotation(text, &type, &exitStatus)) return exitStatus;
     if (list.GetNumTypes() == 0) first = type;
     if (const int32_t status = list.AppendType(type, nullptr); status != 0)
-      return FailWithStatus("cannot build the list of types", status, diagnostics.Take());
+      return FailWithStatus("cannot build the list of types", status);
   }
   const PersistTDData persist(version);
-  OwnedHandle flat;
+  vellum::OwnedHandle flat;
   // A list writer refuses an empty entry unless told to skip it; a skipped entry is stored as the
   // index of the entry before it (the first record for a first entry).
   const int32_t status = texts.size() == 1
                              ? FlattenOneType(&persist, first, flat.Out(), nullptr)
                              : FlattenListOfTypes(&persist, &list, nullptr, flat.Out(), 0, nullptr, 1);
-  if (status != 0) return FailWithStatus("cannot write the type string", status, diagnostics.Take());
-  std::printf("%s\n", LowerHex(flat.Data(), flat.Size()).c_str());
+  if (status != 0) return FailWithStatus("cannot write the type string", status);
+  std::printf("%s\n", LowerHex(flat.Bytes().data(), flat.Bytes().size()).c_str());
   PrintWarnings(diagnostics.Take());
   return 0;
 }
@@ -273,7 +236,7 @@ int DecodeTypes(const std::vector<std::string>& words, uint32_t version, bool du
   TMTypeList list;
   const int32_t status = UnFlattenListOfTypes(&persist, bytes.data(), static_cast<uint32_t>(bytes.size()), &list,
                                               nullptr, 0, nullptr);
-  if (status != 0) return FailWithStatus("cannot decode the type string", status, diagnostics.Take());
+  if (status != 0) return FailWithStatus("cannot decode the type string", status);
   PrintWarnings(diagnostics.Take());
   static const uint8_t kDumpPrefix[] = "  ";
   for (int32_t i = 0; i < list.GetNumTypes(); ++i) {
@@ -337,25 +300,23 @@ int EncodeData(const std::string& text, const std::string& json, uint32_t versio
     return exitStatus;
   JsonValue value;
   if (const int exitStatus = ReadJsonArgument(json, &value); exitStatus != 0) return exitStatus;
-  OwnedDatum datum(type);
-  if (datum.Status() != 0) return FailWithStatus("cannot make a value of the type", datum.Status(), diagnostics.Take());
+  vellum::Value datum(type);
+  if (datum.Status() != 0) return FailWithStatus("cannot make a value of the type", datum.Status());
   try {
     JsonToData(type, value, datum.Data());
   } catch (const JsonViewError& e) {
     return Fail(kExitFailure, std::string("the JSON value does not fit the type: ") + e.what());
   }
-  OutputBuf out;
-  KoDataWriter writer(&out, version, nullptr, 0);
-  if (const int32_t status = writer.WriteData(type, datum.Data(), 1); status != 0)
-    return FailWithStatus("cannot flatten the value", status, diagnostics.Take());
-  std::printf("%s\n", LowerHex(out.Data(), out.GetBytesWritten()).c_str());
+  std::vector<uint8_t> flat;
+  if (const int32_t status = vellum::FlattenData(datum, &flat, version); status != 0)
+    return FailWithStatus("cannot flatten the value", status);
+  std::printf("%s\n", LowerHex(flat.data(), flat.size()).c_str());
   PrintWarnings(diagnostics.Take());
   return 0;
 }
 
 // The type of a data command: the notation, or the one entry of a type string.
-int DataType(const std::string* text, const std::string* typeString, uint32_t version, TDR* type,
-             DiagnosticCapture& diagnostics) {
+int DataType(const std::string* text, const std::string* typeString, uint32_t version, TDR* type) {
   if (text != nullptr) {
     int exitStatus = 0;
     return ParseNotation(*text, type, &exitStatus) ? 0 : exitStatus;
@@ -364,7 +325,7 @@ int DataType(const std::string* text, const std::string* typeString, uint32_t ve
   if (const int exitStatus = ReadBytesArgument({*typeString}, "TYPEBYTES", &bytes); exitStatus != 0) return exitStatus;
   const PersistTDData persist(version);
   const int32_t status = UnFlattenOneType(&persist, bytes.data(), static_cast<uint32_t>(bytes.size()), type, nullptr);
-  if (status != 0) return FailWithStatus("cannot decode the type string", status, diagnostics.Take());
+  if (status != 0) return FailWithStatus("cannot decode the type string", status);
   return 0;
 }
 
@@ -376,22 +337,20 @@ int DecodeData(const std::vector<std::string>& words, const std::string* typeStr
   if (typeString != nullptr && *typeString == "-" && byteWords.front() == "-")
     return Fail(kExitUsage, "standard input can give TYPEBYTES or BYTES, not both (try --help)");
   TDR type;
-  if (const int exitStatus = DataType(typeString != nullptr ? nullptr : &words.front(), typeString, version, &type,
-                                      diagnostics);
+  if (const int exitStatus = DataType(typeString != nullptr ? nullptr : &words.front(), typeString, version, &type);
       exitStatus != 0)
     return exitStatus;
   if (int exitStatus = 0; !CheckDataType(type, &exitStatus)) return exitStatus;
   std::vector<uint8_t> bytes;
   if (const int exitStatus = ReadBytesArgument(byteWords, "BYTES", &bytes); exitStatus != 0) return exitStatus;
-  OwnedDatum datum(type);
-  if (datum.Status() != 0) return FailWithStatus("cannot make a value of the type", datum.Status(), diagnostics.Take());
-  InputBuf in(bytes.data(), bytes.size());
-  KoDataReader reader(&in, version, nullptr, nullptr, 0);
-  if (const int32_t status = reader.ReadData(type, datum.Data(), 1); status != 0)
-    return FailWithStatus("cannot read the data", status, diagnostics.Take());
-  if (reader.BytesLeft() != 0) {
-    return Fail(kExitFailure, std::to_string(reader.BytesLeft()) + " byte(s) follow the value, which ends at byte " +
-                                  std::to_string(in.Position()));
+  vellum::Value datum(type);
+  if (datum.Status() != 0) return FailWithStatus("cannot make a value of the type", datum.Status());
+  size_t used = 0;
+  if (const int32_t status = vellum::UnflattenData(bytes, &datum, version, &used); status != 0)
+    return FailWithStatus("cannot read the data", status);
+  if (used != bytes.size()) {
+    return Fail(kExitFailure, std::to_string(bytes.size() - used) + " byte(s) follow the value, which ends at byte " +
+                                  std::to_string(used));
   }
   JsonValue value;
   try {
@@ -542,9 +501,9 @@ int main(int argc, char** argv) {
   // Nothing the library raises may end the tool without its one line.
   try {
     DiagnosticCapture diagnostics;
-    LibrarySession session;
+    vellum::Session session;
     if (session.Status() != 0)
-      return FailWithStatus("the type manager did not start", session.Status(), diagnostics.Take());
+      return FailWithStatus("the type manager did not start", session.Status());
     if (codes->parsed()) return PrintCodes();
     if (type->parsed()) {
       const int32_t align = alignText.empty() ? 0 : std::stoi(alignText);
