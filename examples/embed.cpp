@@ -15,7 +15,7 @@ int main() {
 
   // A writable descriptor, built and then interned: equal types are one shared object.
   TDWCluster reading;
-  reading << TDWInt32(reinterpret_cast<const uint8_t*>("count")) << TDWString(reinterpret_cast<const uint8_t*>("label"));
+  reading << TDWInt32("count") << TDWString("label");
   const TDRCluster type = reading.CheckIn();
   if (!(reading.CheckIn() == type)) return 1;
 

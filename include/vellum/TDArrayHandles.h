@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdint>
+#include <string_view>
 
 #include "runtime/PXTypes.h"
 #include "vellum/TDContainerHandles.h"
@@ -152,6 +153,8 @@ class TDRArray : public TDRTyped<TDRArray, TDWArray, TDRArrayBase, ArrayKind> {
  public:
   using TDRTyped::TDRTyped;
   TDRArray(int32_t nDims, const TDR& elt, const uint8_t* name = nullptr);
+  TDRArray(int32_t nDims, const TDR& elt, std::string_view name)
+      : TDRArray(nDims, elt, vellum::detail::CName(name).Get()) {}
   // A SubArray with the same element, dimensions and name.
   TDRSubArray ConvertToSubArray() const;
   // Where the first element lies in `handle`'s block; null for a null handle or descriptor.
@@ -167,6 +170,8 @@ class TDWArray : public TDWTyped<TDRArray, TDWArray, TDWArrayBase, ArrayKind> {
  public:
   using TDWTyped::TDWTyped;
   TDWArray(int32_t nDims, const TD& elt, const uint8_t* name = nullptr);
+  TDWArray(int32_t nDims, const TD& elt, std::string_view name)
+      : TDWArray(nDims, elt, vellum::detail::CName(name).Get()) {}
   TDWSubArray ConvertToSubArray() const;
 };
 
@@ -174,6 +179,8 @@ class TDRSubArray : public TDRTyped<TDRSubArray, TDWSubArray, TDRArrayBase, SubA
  public:
   using TDRTyped::TDRTyped;
   TDRSubArray(int32_t nDims, const TDR& elt, const uint8_t* name = nullptr);
+  TDRSubArray(int32_t nDims, const TDR& elt, std::string_view name)
+      : TDRSubArray(nDims, elt, vellum::detail::CName(name).Get()) {}
   // An Array with the same element, dimensions and name.
   TDRArray ConvertToArray() const;
   // Where the record keeps its data pointer, and the size and stride of dimension `dim`: 0,
@@ -188,6 +195,8 @@ class TDWSubArray : public TDWTyped<TDRSubArray, TDWSubArray, TDWArrayBase, SubA
  public:
   using TDWTyped::TDWTyped;
   TDWSubArray(int32_t nDims, const TD& elt, const uint8_t* name = nullptr);
+  TDWSubArray(int32_t nDims, const TD& elt, std::string_view name)
+      : TDWSubArray(nDims, elt, vellum::detail::CName(name).Get()) {}
   TDWArray ConvertToArray() const;
 };
 
@@ -195,12 +204,16 @@ class TDRArrayDataPtr : public TDRTyped<TDRArrayDataPtr, TDWArrayDataPtr, TDRArr
  public:
   using TDRTyped::TDRTyped;
   TDRArrayDataPtr(int32_t nDims, const TDR& elt, const uint8_t* name = nullptr);
+  TDRArrayDataPtr(int32_t nDims, const TDR& elt, std::string_view name)
+      : TDRArrayDataPtr(nDims, elt, vellum::detail::CName(name).Get()) {}
 };
 
 class TDWArrayDataPtr : public TDWTyped<TDRArrayDataPtr, TDWArrayDataPtr, TDWArrayBase, ArrayDataPtrKind> {
  public:
   using TDWTyped::TDWTyped;
   TDWArrayDataPtr(int32_t nDims, const TD& elt, const uint8_t* name = nullptr);
+  TDWArrayDataPtr(int32_t nDims, const TD& elt, std::string_view name)
+      : TDWArrayDataPtr(nDims, elt, vellum::detail::CName(name).Get()) {}
 };
 
 // The word of dimension `index` and the dimension count of any array kind; 0 for anything else.

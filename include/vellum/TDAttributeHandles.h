@@ -4,6 +4,7 @@
 #pragma once
 
 #include <cstdint>
+#include <string_view>
 #include <string>
 
 #include "runtime/PXPath.h"
@@ -41,6 +42,7 @@ class TDRName : public TDAttribute {
   TDRName() noexcept = default;
   // The interned name of that text; a null handle for a null or empty string.
   explicit TDRName(const uint8_t* cString);
+  explicit TDRName(std::string_view text) : TDRName(vellum::detail::CName(text).Get()) {}
   // Holds `p` when `take` is nonzero and `p` is not null.
   TDRName(const TDNameImpPtr& p, int32_t take);
 
@@ -55,13 +57,14 @@ class TDWName : public TDAttribute {
   TDWName() noexcept = default;
   // A new, private name object with that text (at most 255 bytes kept).
   explicit TDWName(const uint8_t* cString);
+  explicit TDWName(std::string_view text) : TDWName(vellum::detail::CName(text).Get()) {}
   // Holds `p` when `take` is nonzero and `p` is a private object; an interned one is refused.
   TDWName(const TDNameImpPtr& p, int32_t take);
 
   TDNameImpPtr GetNameImpPtr() const;
   const uint8_t* GetNamePStr() const;
   // Replace the text; 42 for a null handle, 2 when the text cannot be allocated.
-  int32_t SetName(const std::string& name);
+  int32_t SetName(std::string_view name);
   int32_t SetName(const uint8_t* cString);
   int32_t SetNamePStr(const uint8_t* pString);
 

@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdint>
+#include <string_view>
 
 #include "vellum/TDHandles.h"
 
@@ -73,6 +74,7 @@ class TDRMultiContainer
   // The index of the first element whose name equals the zero-terminated `name` (both compared
   // as Pascal strings, so only the first 255 bytes count); -1 when none.
   int32_t GetEltPos(const uint8_t* name) const;
+  int32_t GetEltPos(std::string_view name) const { return GetEltPos(vellum::detail::CName(name).Get()); }
 };
 
 class TDWMultiContainer
@@ -84,6 +86,7 @@ class TDWMultiContainer
   // absent element, or for an interned (read-only) element.
   TDW GetEltTD(int32_t index) const;
   int32_t GetEltPos(const uint8_t* name) const;
+  int32_t GetEltPos(std::string_view name) const { return GetEltPos(vellum::detail::CName(name).Get()); }
 
   // Elements are held, not copied: the object an argument holds becomes the element. Each
   // returns 0; 42 for a null handle or a null element; 1 for an index out of range, and 1 after
@@ -111,6 +114,9 @@ class TDRCluster : public TDRTyped<TDRCluster, TDWCluster, TDRMultiContainer, Cl
   int32_t GetEltOffset(int32_t index, ITargetPlatformAlignment* platform = nullptr) const;
   // The offset of the first element named `name`; 0 after a diagnostic when none has that name.
   int32_t GetEltOffsetByName(const uint8_t* name, ITargetPlatformAlignment* platform = nullptr) const;
+  int32_t GetEltOffsetByName(std::string_view name, ITargetPlatformAlignment* platform = nullptr) const {
+    return GetEltOffsetByName(vellum::detail::CName(name).Get(), platform);
+  }
   // As GetEltOffsetByName; without a platform, a result other than `expected` is reported and
   // `expected` returned.
   int32_t GetEltOffsetByNameDebug(const uint8_t* name, ITargetPlatformAlignment* platform, int32_t expected) const;
@@ -127,6 +133,9 @@ class TDWCluster : public TDWTyped<TDRCluster, TDWCluster, TDWMultiContainer, Cl
 
   int32_t GetEltOffset(int32_t index, ITargetPlatformAlignment* platform = nullptr) const;
   int32_t GetEltOffsetByName(const uint8_t* name, ITargetPlatformAlignment* platform = nullptr) const;
+  int32_t GetEltOffsetByName(std::string_view name, ITargetPlatformAlignment* platform = nullptr) const {
+    return GetEltOffsetByName(vellum::detail::CName(name).Get(), platform);
+  }
   int32_t GetEltOffsetByNameDebug(const uint8_t* name, ITargetPlatformAlignment* platform, int32_t expected) const;
   void* GetEltPtr(int32_t index, void* data) const;
   const void* GetEltPtr(int32_t index, const void* data) const;

@@ -4,6 +4,7 @@
 
 #include <cstdint>
 #include <string>
+#include <string_view>
 #include <type_traits>
 
 #include "vellum/TDFlags.h"
@@ -260,7 +261,7 @@ class TDW : public TD {
 
   // Setters: 42 and no change for a null handle, otherwise 0 unless stated.
   // An empty or null text removes the name; 2 when a new name object cannot be allocated.
-  int32_t SetName(const std::string& name);
+  int32_t SetName(std::string_view name);
   int32_t SetName(const uint8_t* cString);
   int32_t SetNamePStr(const uint8_t* pString);
   int32_t SetName(const TDWName& name);
@@ -331,6 +332,17 @@ std::string ToString(const TDR& type);
 namespace vellum::detail {
 TDImpPtr Admitted(const TDImpPtr& p, int32_t check, bool (*admit)(const TDImp&));
 TDImpPtr CheckInNew(const TDImpPtr& fresh);
+
+// A name given as text, zero-terminated for the calls that take C strings. A temporary made in
+// a call's arguments lives until the call returns.
+class CName {
+ public:
+  explicit CName(std::string_view text) : text_(text) {}
+  const uint8_t* Get() const { return reinterpret_cast<const uint8_t*>(text_.c_str()); }
+
+ private:
+  std::string text_;
+};
 }  // namespace vellum::detail
 
 template <class Self, class Writable, class Base, class Kind>
@@ -339,6 +351,7 @@ class TDRTyped : public Base {
   // A new default object of the kind, checked in.
   TDRTyped() : Base(vellum::detail::CheckInNew(Kind::New(nullptr)), 1) {}
   explicit TDRTyped(const uint8_t* name) : Base(vellum::detail::CheckInNew(Kind::New(name)), 1) {}
+  explicit TDRTyped(std::string_view name) : TDRTyped(vellum::detail::CName(name).Get()) {}
   TDRTyped(const TDImpPtr& p, int32_t check)
       : Base(vellum::detail::Admitted(p, check, &Kind::Admit), 1) {}
 
@@ -351,6 +364,7 @@ class TDWTyped : public Base {
   // A new default object of the kind, writable.
   TDWTyped() : Base(Kind::New(nullptr), 1) {}
   explicit TDWTyped(const uint8_t* name) : Base(Kind::New(name), 1) {}
+  explicit TDWTyped(std::string_view name) : TDWTyped(vellum::detail::CName(name).Get()) {}
   TDWTyped(const TDImpPtr& p, int32_t check)
       : Base(vellum::detail::Admitted(p, check, &Kind::Admit), 1) {}
 

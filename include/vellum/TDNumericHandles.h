@@ -4,6 +4,7 @@
 #pragma once
 
 #include <cstdint>
+#include <string_view>
 
 #include "FixedPoint/fxp.h"
 #include "vellum/TDAttributeHandles.h"
@@ -206,7 +207,8 @@ inline TDImpPtr Fresh(const TDImpPtr& p) { return p; }
   Self(const Member& member, const uint8_t* name, const TDWTypedef& typedefLink)                           \
       : Base(Finish(vellum::detail::NewBasicNumeric(TypeCode::Kind, name, typedefLink.GetTypedefImpPtr(),    \
                                                     EnumArg, UnitsArg, Copy)),                              \
-             1) {}
+             1) {} \
+  Self(const Member& member, std::string_view name) : Self(member, vellum::detail::CName(name).Get()) {}
 #define VELLUM_NUMERIC_ENUM_CTORS(Self, Base, Kind, Finish, Copy)                                          \
   VELLUM_NUMERIC_MEMBER_CTORS(Self, Base, Kind, Finish, Copy, TDREnum, member.GetEnumImpPtr(), TDUnitsImpPtr()) \
   VELLUM_NUMERIC_MEMBER_CTORS(Self, Base, Kind, Finish, Copy, TDWEnum, member.GetEnumImpPtr(), TDUnitsImpPtr())

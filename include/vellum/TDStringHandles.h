@@ -3,6 +3,7 @@
 #pragma once
 
 #include <cstdint>
+#include <string_view>
 
 #include "runtime/PXPath.h"
 #include "runtime/PXTypes.h"
@@ -111,6 +112,7 @@ class TDRString : public TDRTyped<TDRString, TDWString, TDRStringBase, StringKin
  public:
   using TDRTyped::TDRTyped;
   TDRString(const uint8_t* name, int32_t bound);
+  TDRString(std::string_view name, int32_t bound) : TDRString(vellum::detail::CName(name).Get(), bound) {}
   // A SubString with the same name and bound.
   TDRSubString ConvertToSubString() const;
 };
@@ -118,6 +120,7 @@ class TDWString : public TDWTyped<TDRString, TDWString, TDWStringBase, StringKin
  public:
   using TDWTyped::TDWTyped;
   TDWString(const uint8_t* name, int32_t bound);
+  TDWString(std::string_view name, int32_t bound) : TDWString(vellum::detail::CName(name).Get(), bound) {}
   TDWSubString ConvertToSubString() const;
 };
 
@@ -125,6 +128,7 @@ class TDRSubString : public TDRTyped<TDRSubString, TDWSubString, TDRStringBase, 
  public:
   using TDRTyped::TDRTyped;
   TDRSubString(const uint8_t* name, int32_t bound);
+  TDRSubString(std::string_view name, int32_t bound) : TDRSubString(vellum::detail::CName(name).Get(), bound) {}
   // A String with the same name and bound.
   TDRString ConvertToString() const;
   // Where the record keeps its data pointer and its length: 0 and 8 in the running process.
@@ -135,6 +139,7 @@ class TDWSubString : public TDWTyped<TDRSubString, TDWSubString, TDWStringBase, 
  public:
   using TDWTyped::TDWTyped;
   TDWSubString(const uint8_t* name, int32_t bound);
+  TDWSubString(std::string_view name, int32_t bound) : TDWSubString(vellum::detail::CName(name).Get(), bound) {}
   TDWString ConvertToString() const;
 };
 
@@ -142,11 +147,13 @@ class TDRPath : public TDRTyped<TDRPath, TDWPath, TDRStringBase, PathKind> {
  public:
   using TDRTyped::TDRTyped;
   TDRPath(const uint8_t* name, int32_t bound);
+  TDRPath(std::string_view name, int32_t bound) : TDRPath(vellum::detail::CName(name).Get(), bound) {}
 };
 class TDWPath : public TDWTyped<TDRPath, TDWPath, TDWStringBase, PathKind> {
  public:
   using TDWTyped::TDWTyped;
   TDWPath(const uint8_t* name, int32_t bound);
+  TDWPath(std::string_view name, int32_t bound) : TDWPath(vellum::detail::CName(name).Get(), bound) {}
 };
 
 class TDRPict : public TDRTyped<TDRPict, TDWPict, TDRStringBase, PictKind> {

@@ -346,7 +346,7 @@ const uint8_t* TDWName::GetNamePStr() const {
   return IsName(imp_) ? As<TDNameImp>(imp_)->GetNamePStr() : EmptyPStr();
 }
 
-int32_t TDWName::SetName(const std::string& name) {
+int32_t TDWName::SetName(std::string_view name) {
   if (!IsName(imp_)) return kStatusNullHandle;
   return As<TDNameImp>(imp_)->SetText(reinterpret_cast<const uint8_t*>(name.data()), name.size());
 }

@@ -271,7 +271,7 @@ TDWName TDW::GetName() const { return imp_ ? TDWName(imp_->GetNameImpPtr(), 1) :
 
 TDWTypedef TDW::GetTypedef() const { return imp_ ? TDWTypedef(imp_->GetTypedefImpPtr(), 1) : TDWTypedef(); }
 
-int32_t TDW::SetName(const std::string& name) {
+int32_t TDW::SetName(std::string_view name) {
   if (!imp_) return kStatusNullHandle;
   imp_->ClearHashValid();
   if (name.empty()) {
