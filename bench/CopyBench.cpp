@@ -88,7 +88,7 @@ void BM_ArrayCopy(benchmark::State& state) {
   UHandle from = nullptr;
   UHandle into = nullptr;
   VectorSetSize(GetfD(), &from, kArrayElements);
-  auto* first = static_cast<uint8_t*>(TDRArray(type.GetImpPtr(), 1).GetFirstElementPtr(from));
+  auto* first = static_cast<uint8_t*>(vellum::As<TDRArray>(type).GetFirstElementPtr(from));
   for (int32_t i = 0; i < kArrayElements; ++i) {
     const double value = i * 0.5;
     std::memcpy(first + sizeof(double) * static_cast<size_t>(i), &value, sizeof value);

@@ -40,7 +40,7 @@ struct DoubleArray {
     EnsureSession();
     type = GetDbl1DTD();
     VectorSetSize(GetfD(), &from, kDoubles);
-    auto* first = static_cast<uint8_t*>(TDRArray(type.GetImpPtr(), 1).GetFirstElementPtr(from));
+    auto* first = static_cast<uint8_t*>(vellum::As<TDRArray>(type).GetFirstElementPtr(from));
     for (int32_t i = 0; i < kDoubles; ++i) {
       const double value = i * 0.25;
       std::memcpy(first + 8 * static_cast<size_t>(i), &value, 8);
@@ -111,8 +111,8 @@ struct RecordArray {
     EnsureSession();
     element = InterpretedStringToType("{iL,fD,S}");
     type = TDRArray(1, element);
-    const TDRCluster cluster(element.GetImpPtr(), 1);
-    TDRArray array(type.GetImpPtr(), 1);
+    const TDRCluster cluster = vellum::As<TDRCluster>(element);
+    TDRArray array = vellum::As<TDRArray>(type);
     array.SetArraySize(&from, kRecords, &kRecords);
     auto* first = static_cast<uint8_t*>(array.GetFirstElementPtr(from));
     const int32_t size = element.DataSize();

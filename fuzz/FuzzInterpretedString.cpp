@@ -23,9 +23,9 @@ class FixedLinker final : public IVILinkMediator {
 // pointer-sized marks or fixed dimensions anywhere in the tree.
 TDTraverseValue FindUnwritten(const TDR& node, void* found) {
   bool unwritten = node.HasName() != 0 || node.HasTypedef() != 0;
-  const TDRBasicNumeric numeric(node.GetImpPtr(), 1);
+  const TDRBasicNumeric numeric = vellum::As<TDRBasicNumeric>(node);
   if (numeric && (numeric.GetEnum().GetNumStrings() != 0 || numeric.IsIntPtrT() != 0)) unwritten = true;
-  const TDRArrayBase array(node.GetImpPtr(), 1);
+  const TDRArrayBase array = vellum::As<TDRArrayBase>(node);
   for (int32_t i = 0; array && i < array.GetNumDims(); ++i) {
     if (array.GetDimSize(i) != -1) unwritten = true;
   }

@@ -131,7 +131,7 @@ bool ParseNotation(const std::string& text, TDR* type, int* exitStatus) {
 // an enumeration or units do not change); "-" for the other kinds.
 std::string NumericColumns(int32_t code) {
   if (static_cast<uint8_t>(code - 1) >= 30) return "-      -     -";
-  const TDRNumeric numeric(MakeDefaultTDRForTypeCode(code).GetImpPtr(), 1);
+  const TDRNumeric numeric = vellum::As<TDRNumeric>(MakeDefaultTDRForTypeCode(code));
   if (!numeric) return "-      -     -";
   char columns[64];
   std::snprintf(columns, sizeof columns, "%-6d %-5d %d", numeric.DataSize(), numeric.GetAlignment(),
