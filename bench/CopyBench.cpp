@@ -41,20 +41,20 @@ void BM_ClusterCopy(benchmark::State& state) {
   const auto size = static_cast<size_t>(type.DataSize());
   std::vector<uint64_t> from((size + 7) / 8, 0);
   std::vector<uint64_t> into((size + 7) / 8, 0);
-  type.InflateDefData(from.data(), 0, 1, 0);
-  type.InflateDefData(into.data(), 0, 1, 0);
+  if (type.InflateDefData(from.data(), 0, 1, 0) != 0 || type.InflateDefData(into.data(), 0, 1, 0) != 0)
+    state.SkipWithError("no default data");
   const int32_t code = 7;
   const double value = 2.5;
   std::memcpy(type.GetEltPtr(0, static_cast<void*>(from.data())), &code, sizeof code);
   std::memcpy(type.GetEltPtr(1, static_cast<void*>(from.data())), &value, sizeof value);
   LStrHandle text = nullptr;
-  StringUtils::ToLStr(kText, &text);
+  if (StringUtils::ToLStr(kText, &text) != 0) state.SkipWithError("no string");
   std::memcpy(type.GetEltPtr(2, static_cast<void*>(from.data())), &text, sizeof text);
   if (type.CopyData(from.data(), into.data(), nullptr, 0) != 0) state.SkipWithError("copy failed");
 
   for (auto _ : state) {
     for (int i = 0; i < kClusterCopies; ++i) {
-      type.CopyData(from.data(), into.data(), nullptr, 0);
+      benchmark::DoNotOptimize(type.CopyData(from.data(), into.data(), nullptr, 0));
       benchmark::DoNotOptimize(into.data());
       benchmark::ClobberMemory();
     }
@@ -87,7 +87,7 @@ void BM_ArrayCopy(benchmark::State& state) {
   const TDR& type = GetDbl1DTD();
   UHandle from = nullptr;
   UHandle into = nullptr;
-  VectorSetSize(GetfD(), &from, kArrayElements);
+  if (VectorSetSize(GetfD(), &from, kArrayElements) != 0) state.SkipWithError("no array");
   auto* first = static_cast<uint8_t*>(vellum::As<TDRArray>(type).GetFirstElementPtr(from));
   for (int32_t i = 0; i < kArrayElements; ++i) {
     const double value = i * 0.5;
@@ -96,7 +96,7 @@ void BM_ArrayCopy(benchmark::State& state) {
   if (type.CopyData(&from, &into, nullptr, 0) != 0) state.SkipWithError("copy failed");
 
   for (auto _ : state) {
-    type.CopyData(&from, &into, nullptr, 0);
+    benchmark::DoNotOptimize(type.CopyData(&from, &into, nullptr, 0));
     benchmark::DoNotOptimize(*into);
     benchmark::ClobberMemory();
   }

@@ -39,7 +39,7 @@ struct DoubleArray {
   DoubleArray() {
     EnsureSession();
     type = GetDbl1DTD();
-    VectorSetSize(GetfD(), &from, kDoubles);
+    if (VectorSetSize(GetfD(), &from, kDoubles) != 0) std::abort();
     auto* first = static_cast<uint8_t*>(vellum::As<TDRArray>(type).GetFirstElementPtr(from));
     for (int32_t i = 0; i < kDoubles; ++i) {
       const double value = i * 0.25;
@@ -113,7 +113,7 @@ struct RecordArray {
     type = TDRArray(1, element);
     const TDRCluster cluster = vellum::As<TDRCluster>(element);
     TDRArray array = vellum::As<TDRArray>(type);
-    array.SetArraySize(&from, kRecords, &kRecords);
+    if (array.SetArraySize(&from, kRecords, &kRecords) != 0) std::abort();
     auto* first = static_cast<uint8_t*>(array.GetFirstElementPtr(from));
     const int32_t size = element.DataSize();
     for (int32_t i = 0; i < kRecords; ++i) {

@@ -4,6 +4,7 @@
 #include <benchmark/benchmark.h>
 
 #include <cstdint>
+#include <cstdlib>
 #include <cstdio>
 #include <string>
 
@@ -54,7 +55,8 @@ TDR BuildRecord(int i) {
 const TMTypeList& Records() {
   static const TMTypeList list = [] {
     TMTypeList built;
-    for (int i = 0; i < kRecords; ++i) built.AppendType(BuildRecord(i), nullptr);
+    for (int i = 0; i < kRecords; ++i)
+      if (built.AppendType(BuildRecord(i), nullptr) != 0) std::abort();
     return built;
   }();
   return list;

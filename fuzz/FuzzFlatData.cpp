@@ -18,7 +18,7 @@ constexpr uint32_t kVersions[] = {0x22308000, 0x08602025, 0x04502003, 0x08600000
 
 TDR Bounded(const TDR& element, int32_t word) {
   TDWArray array(0, element);
-  array.AddDim(word, 0);
+  if (array.AddDim(word, 0) != 0) std::abort();
   return array.CheckIn();
 }
 
@@ -39,11 +39,10 @@ std::vector<TDR> MakeTypes() {
   types.push_back(Bounded(InterpretedStringToType("{S,iB}"), vellum::bound::Fixed(2)));
   types.push_back(Bounded(TDRString(nullptr, vellum::bound::Fixed(3)), 4));
   TDWRepeatedBlock repeated;
-  repeated.SetEltTD(InterpretedStringToType("{iW,S}"));
-  repeated.SetNumBlocks(3);
+  if (repeated.SetEltTD(InterpretedStringToType("{iW,S}")) != 0 || repeated.SetNumBlocks(3) != 0) std::abort();
   types.push_back(repeated.CheckIn());
   TDWBlock block;
-  block.SetBlockSize(6);
+  if (block.SetBlockSize(6) != 0) std::abort();
   types.push_back(block.CheckIn());
   return types;
 }

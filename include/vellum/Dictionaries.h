@@ -31,7 +31,7 @@ int32_t GetNumDictionaries();
 // which exists while the service runs.
 bool HasRecursiveTypesTable();
 // 0; 42 without a table; 1 for a null descriptor; 2 when memory runs out.
-int32_t InsertRecursiveTypeIntoTable(const TDR& type);
+[[nodiscard]] int32_t InsertRecursiveTypeIntoTable(const TDR& type);
 int32_t RecursiveTypesTableSize();
 
 // The first collection reads the logging key and keeps it; this makes the next one read it again

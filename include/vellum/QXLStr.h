@@ -18,7 +18,7 @@ class IQXStr {
   // Makes the string `length` bytes long. With keepContents the first min(old, new) bytes stay
   // and any growth is zero; without it every byte is zero. Status 0, 1 for a negative length,
   // 2 when memory runs out (then unchanged).
-  virtual int32_t SetSize(int32_t length, bool keepContents) = 0;
+  [[nodiscard]] virtual int32_t SetSize(int32_t length, bool keepContents) = 0;
 
  protected:
   IQXStr() = default;
@@ -49,28 +49,28 @@ class CQXLStr : public IQXStr {
   // Each replaces the string with a copy of its argument (which may point into this string).
   // Null is the empty string. A negative length, null bytes with a positive length, or a handle
   // that is not a live counted string is status 1; running out of memory is 2.
-  int32_t CopyFromCStr(const uint8_t* cstr);
-  int32_t CopyFromCStr(const uint8_t* bytes, int32_t length);
-  int32_t CopyFromLStr(LStrHandle handle);
+  [[nodiscard]] int32_t CopyFromCStr(const uint8_t* cstr);
+  [[nodiscard]] int32_t CopyFromCStr(const uint8_t* bytes, int32_t length);
+  [[nodiscard]] int32_t CopyFromLStr(LStrHandle handle);
 
   // Copies at most capacity - 1 bytes into buffer and a terminating zero. A null buffer or a
   // capacity below 1 has no room even for the terminator: it is reported (level 2), nothing is
   // written and the status is 1.
-  int32_t CopyToCStr(int32_t capacity, uint8_t* buffer) const;
+  [[nodiscard]] int32_t CopyToCStr(int32_t capacity, uint8_t* buffer) const;
   // Writes at most 255 bytes as a length byte and bytes into a 256-byte buffer. A null buffer
   // is reported (level 2) and is status 1.
-  int32_t CopyToPStr(uint8_t* buffer) const;
+  [[nodiscard]] int32_t CopyToPStr(uint8_t* buffer) const;
 
   const uint8_t* GetReadPtr() const override;
   uint8_t* GetWritePtr() override;
   int32_t GetSize() const override;
-  int32_t SetSize(int32_t length, bool keepContents) override;
+  [[nodiscard]] int32_t SetSize(int32_t length, bool keepContents) override;
 
   // The handle, still owned by this object; null while empty.
   LStrHandle GetLStrHandle() const { return handle_; }
 
  private:
-  int32_t Replace(const uint8_t* bytes, size_t length);
+  [[nodiscard]] int32_t Replace(const uint8_t* bytes, size_t length);
   void Dispose();
 
   LStrHandle handle_ = nullptr;

@@ -39,29 +39,29 @@ class QualifiedName {
   const std::string& GetFileName() const;
 
   void Clear() { components_.clear(); }
-  int32_t Reserve(int32_t n);
+  [[nodiscard]] int32_t Reserve(int32_t n);
   // Becomes a copy of other; status 0, or 2 when memory runs out (then unchanged).
-  int32_t Copy(const QualifiedName& other);
+  [[nodiscard]] int32_t Copy(const QualifiedName& other);
   // Removes the component at i clamped to 0 .. count - 1; nothing for an empty name.
   void Delete(int32_t i);
   // Inserts at max(position, 0) when position < count, else appends.
-  int32_t Insert(const std::string& component, int32_t position);
-  int32_t Insert(const uint8_t* pstr, int32_t position);  // a null PStr inserts ""
+  [[nodiscard]] int32_t Insert(const std::string& component, int32_t position);
+  [[nodiscard]] int32_t Insert(const uint8_t* pstr, int32_t position);  // a null PStr inserts ""
   // The same with `length` bytes; null bytes with a positive length or a negative length is 1.
-  int32_t InsertStringBuffer(const uint8_t* bytes, int32_t length, int32_t position);
+  [[nodiscard]] int32_t InsertStringBuffer(const uint8_t* bytes, int32_t length, int32_t position);
   // Puts the first count(other) - n components of other in front, in order (n is clamped to
   // 0 .. count(other)). On failure the name is unchanged.
-  int32_t Prepend(const QualifiedName& other, int32_t n);
+  [[nodiscard]] int32_t Prepend(const QualifiedName& other, int32_t n);
 
   // Parses the text form: the name is cleared, then each run up to the next ':' (or the end)
   // becomes a component; after a ':' one more ':' is skipped, so "a::b" is "a", "b" and
   // "a:::b" is "a", "", "b". An empty text gives the empty name.
-  int32_t FromDelimitedName(const std::string& text);
+  [[nodiscard]] int32_t FromDelimitedName(const std::string& text);
   // The same from a counted string; null gives the empty name, a negative count is status 1.
-  int32_t FromDelimitedName(const LStr* text);
+  [[nodiscard]] int32_t FromDelimitedName(const LStr* text);
   // The same, but a component that is empty or starts or ends with white space stops the parse
   // with status 1; the components before it stay.
-  int32_t FromDelimitedNameWithSanityCheck(const std::string& text);
+  [[nodiscard]] int32_t FromDelimitedNameWithSanityCheck(const std::string& text);
   // The components joined with ':'. Null `text` is status 1.
   int32_t ToDelimitedName(std::string* text) const;
 
@@ -86,7 +86,7 @@ class QualifiedName {
   // Reads the flat form, replacing the name. A count that the bytes left cannot hold, or input
   // that ends early, is 74 before anything is allocated; running out of memory is 2. Any failure
   // becomes the reader's error and leaves the name empty. Otherwise the reader's status.
-  int32_t UnFlatten(KoDataReader* reader);
+  [[nodiscard]] int32_t UnFlatten(KoDataReader* reader);
   // The bytes Flatten writes for that format version; 0 when the name has no flat form.
   int32_t GetFlatSize(uint32_t version) const;
 
@@ -97,8 +97,8 @@ class QualifiedName {
 
  private:
   using Components = std::vector<std::string, PXAllocator<std::string>>;
-  int32_t Parse(const uint8_t* text, size_t size, bool sanityCheck);
-  int32_t InsertBytes(const uint8_t* bytes, size_t length, int32_t position);
+  [[nodiscard]] int32_t Parse(const uint8_t* text, size_t size, bool sanityCheck);
+  [[nodiscard]] int32_t InsertBytes(const uint8_t* bytes, size_t length, int32_t position);
   bool HasFlatForm() const;
 
   Components components_;

@@ -53,14 +53,14 @@ bool CompactSubArray(const SubArrayDimension* entries, int32_t nDims, int64_t el
 // to its dimension words. 0; 1 for a null handle pointer, a negative count, an element that is
 // itself an array, or a block whose dimension words overflow or need more bytes than it holds
 // (nothing is changed then); 2 when memory runs out (the block is as it was); 42 for a null elt.
-int32_t SetArraySizeFromTDR(const TDR& elt, int32_t nDims, UHandle* handle, int32_t count, int32_t allocWhenEmpty);
+[[nodiscard]] int32_t SetArraySizeFromTDR(const TDR& elt, int32_t nDims, UHandle* handle, int32_t count, int32_t allocWhenEmpty);
 // As above; `inflateFlags` goes to the elements' InflateDefData.
 int32_t SetArraySizeFromTDR2(const TDR& elt, int32_t nDims, UHandle* handle, int32_t count, int32_t allocWhenEmpty,
                              int32_t inflateFlags);
 // One dimension: resized to n elements, then the dimension word set to n (when there is a block).
-int32_t VectorSetSize(const TDR& elt, UHandle* handle, int32_t n);
+[[nodiscard]] int32_t VectorSetSize(const TDR& elt, UHandle* handle, int32_t n);
 // One dimension: resized to the length of `model` (a null model is empty).
-int32_t VectorResizeTDR(const TDR& elt, UHandle* handle, UHandle model);
+[[nodiscard]] int32_t VectorResizeTDR(const TDR& elt, UHandle* handle, UHandle model);
 
 // Whether new elements of `elt` need their default inflated, rather than zeroed: the type holds,
 // looking into clusters and repeated blocks, a bounded or fixed string-like kind (not Path) or a
@@ -76,7 +76,7 @@ bool TDContainsBoundedOrFixed(const TDR& type);
 // of dimension words and padding followed by the elements: *dst is resized or made. A null src
 // disposes *dst and sets it null. 1 for a null dst pointer, or a src block smaller than its
 // dimension words say (after a diagnostic); 2 when memory runs out (*dst unchanged).
-int32_t CopyFlatArray(int32_t headerSize, UHandle src, UHandle* dst, int32_t nDims, int32_t eltSize);
+[[nodiscard]] int32_t CopyFlatArray(int32_t headerSize, UHandle src, UHandle* dst, int32_t nDims, int32_t eltSize);
 
 // --- kinds ---------------------------------------------------------------------------------------
 
@@ -139,12 +139,12 @@ class TDWArrayBase : public TDWTyped<TDRArrayBase, TDWArrayBase, TDWSingleContai
   // Setters: 0; 42 for a null handle (and, except AddDim, for a missing dimension list); 1 for
   // an index out of range or a negative count; 2 when memory runs out (nothing changed).
   // Inserts `word` at `position` when 0 <= position < count, else appends; starts a missing list.
-  int32_t AddDim(int32_t word, int32_t position = -1);
-  int32_t RemoveDim(int32_t index);
-  int32_t RemoveAllDims();
+  [[nodiscard]] int32_t AddDim(int32_t word, int32_t position = -1);
+  [[nodiscard]] int32_t RemoveDim(int32_t index);
+  [[nodiscard]] int32_t RemoveAllDims();
   // New dimensions are variable; extra ones are dropped from the end.
-  int32_t SetNumDims(int32_t count);
-  int32_t SetDimSize(int32_t index, int32_t word);
+  [[nodiscard]] int32_t SetNumDims(int32_t count);
+  [[nodiscard]] int32_t SetDimSize(int32_t index, int32_t word);
   // The previous mark (false for a null handle).
   bool SetIsColumnVector(bool columnVector);
 };
@@ -160,10 +160,10 @@ class TDRArray : public TDRTyped<TDRArray, TDWArray, TDRArrayBase, ArrayKind> {
   // Where the first element lies in `handle`'s block; null for a null handle or descriptor.
   void* GetFirstElementPtr(UHandle handle, ITargetPlatformAlignment* platform = nullptr) const;
   // The resizing of SetArraySizeFromTDR for this array, with plain allocation.
-  int32_t SetArraySize(UHandle* handle, int32_t count) const;
+  [[nodiscard]] int32_t SetArraySize(UHandle* handle, int32_t count) const;
   // The same, then the dimension words copied from `dims` (zeroed when null) into the block; a
   // count of 0 with a nonzero dimension word keeps a block of dimension words only.
-  int32_t SetArraySize(UHandle* handle, int32_t count, const int32_t* dims) const;
+  [[nodiscard]] int32_t SetArraySize(UHandle* handle, int32_t count, const int32_t* dims) const;
 };
 
 class TDWArray : public TDWTyped<TDRArray, TDWArray, TDWArrayBase, ArrayKind> {

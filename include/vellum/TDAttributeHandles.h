@@ -64,9 +64,9 @@ class TDWName : public TDAttribute {
   TDNameImpPtr GetNameImpPtr() const;
   const uint8_t* GetNamePStr() const;
   // Replace the text; 42 for a null handle, 2 when the text cannot be allocated.
-  int32_t SetName(std::string_view name);
-  int32_t SetName(const uint8_t* cString);
-  int32_t SetNamePStr(const uint8_t* pString);
+  [[nodiscard]] int32_t SetName(std::string_view name);
+  [[nodiscard]] int32_t SetName(const uint8_t* cString);
+  [[nodiscard]] int32_t SetNamePStr(const uint8_t* pString);
 
   TDRName CheckIn() const;
   TDWName Clone() const;
@@ -104,9 +104,9 @@ class TDWTypedef : public TDAttribute {
   Path GetVIPath() const;
   int32_t IsPathized() const;
   // Each replaces its field; 42 for a null handle, 2 when a copy cannot be allocated.
-  int32_t SetVIName(const QualifiedName& viName);
-  int32_t SetVIPath(Path viPath);
-  int32_t SetTimeStamp(uint32_t timeStamp);
+  [[nodiscard]] int32_t SetVIName(const QualifiedName& viName);
+  [[nodiscard]] int32_t SetVIPath(Path viPath);
+  [[nodiscard]] int32_t SetTimeStamp(uint32_t timeStamp);
 
   TDRTypedef CheckIn() const;
   TDWTypedef Clone() const;

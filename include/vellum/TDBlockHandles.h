@@ -71,7 +71,7 @@ class TDWSizedBlock : public TDWTyped<TDRSizedBlock, TDWSizedBlock, TDW, SizedBl
  public:
   using TDWTyped::TDWTyped;
   int32_t GetBlockSize() const;
-  int32_t SetBlockSize(int32_t size);
+  [[nodiscard]] int32_t SetBlockSize(int32_t size);
 };
 
 // Opaque bytes aligned to 1.
@@ -95,7 +95,7 @@ class TDWAlignedBlock : public TDWTyped<TDRAlignedBlock, TDWAlignedBlock, TDWSiz
  public:
   using TDWTyped::TDWTyped;
   uint16_t GetAlignment() const;
-  int32_t SetAlignment(uint16_t alignment);
+  [[nodiscard]] int32_t SetAlignment(uint16_t alignment);
 };
 
 // Bytes laid out as the element type (set with SetEltTD).
@@ -110,7 +110,7 @@ class TDWTypeBlock : public TDWTyped<TDRTypeBlock, TDWTypeBlock, TDWSingleContai
   using TDWTyped::TDWTyped;
   uint16_t GetAlignment() const;
   // A type block takes its layout from its element: this changes nothing and returns 42.
-  int32_t SetAlignment(uint16_t alignment);
+  [[nodiscard]] int32_t SetAlignment(uint16_t alignment);
 };
 
 // No bytes; only an alignment (1 when made).
@@ -123,7 +123,7 @@ class TDWVoidBlock : public TDWTyped<TDRVoidBlock, TDWVoidBlock, TDWSingleContai
  public:
   using TDWTyped::TDWTyped;
   uint16_t GetAlignment() const;
-  int32_t SetAlignment(uint16_t alignment);
+  [[nodiscard]] int32_t SetAlignment(uint16_t alignment);
 };
 
 // The element repeated a number of times (0 when made), one after another.
@@ -139,7 +139,7 @@ class TDWRepeatedBlock
  public:
   using TDWTyped::TDWTyped;
   uint32_t GetNumBlocks() const;
-  int32_t SetNumBlocks(uint32_t count);
+  [[nodiscard]] int32_t SetNumBlocks(uint32_t count);
 };
 
 // A zero-size cluster element that makes the cluster align as its source type does.
@@ -156,8 +156,8 @@ class TDWAlignmentMarker
   using TDWTyped::TDWTyped;
   // The source itself (null when there is none or it is interned).
   TDW GetAlignmentSource() const;
-  int32_t SetAlignmentSource(const TD& source);
-  int32_t RemoveAlignmentSource();
+  [[nodiscard]] int32_t SetAlignmentSource(const TD& source);
+  [[nodiscard]] int32_t RemoveAlignmentSource();
 };
 
 // A writable copy of `parent` with an alignment marker appended whose source is another writable

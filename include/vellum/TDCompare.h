@@ -34,5 +34,5 @@ int32_t CompareDataTDR(const TDR& type, const void* a, const void* b, int32_t va
 // comparison runs. A later registration for the same code replaces this one. 0; 1 after a
 // diagnostic for a null `compare`; 2 when memory runs out (nothing changed). Registrations are
 // made at start-up, before comparisons begin; the table is read without a lock.
-int32_t RegisterCompareDataFunctionForTypeCode(int16_t typeCode, CompareDataApplicableProc applies,
+[[nodiscard]] int32_t RegisterCompareDataFunctionForTypeCode(int16_t typeCode, CompareDataApplicableProc applies,
                                                CompareDataProc compare);

@@ -60,8 +60,8 @@ class TDWSingleContainer
   TDW GetEltTD() const;
   // The element becomes the object the argument holds (a null one removes it). 42 for a null
   // handle; 1 after a diagnostic when the element would contain this descriptor.
-  int32_t SetEltTD(const TD& element);
-  int32_t RemoveEltTD();
+  [[nodiscard]] int32_t SetEltTD(const TD& element);
+  [[nodiscard]] int32_t RemoveEltTD();
 };
 
 class TDRMultiContainer
@@ -91,13 +91,13 @@ class TDWMultiContainer
   // Elements are held, not copied: the object an argument holds becomes the element. Each
   // returns 0; 42 for a null handle or a null element; 1 for an index out of range, and 1 after
   // a diagnostic when the element would contain this descriptor; 2 when memory runs out.
-  int32_t AppendEltTD(const TD& element);
+  [[nodiscard]] int32_t AppendEltTD(const TD& element);
   // At `index` (0 to the element count; the count appends).
-  int32_t InsertEltTDAt(const TD& element, int32_t index);
-  int32_t ReplaceEltTDAt(const TD& element, int32_t index);
-  int32_t RemoveAllEltTDs();
+  [[nodiscard]] int32_t InsertEltTDAt(const TD& element, int32_t index);
+  [[nodiscard]] int32_t ReplaceEltTDAt(const TD& element, int32_t index);
+  [[nodiscard]] int32_t RemoveAllEltTDs();
   // Room for `count` elements; the elements do not change.
-  int32_t ReserveElementCount(int32_t count);
+  [[nodiscard]] int32_t ReserveElementCount(int32_t count);
 
   // Appends and returns this handle for chaining. When appending fails a diagnostic is written
   // and a shared handle without a descriptor is returned, on which every further `<<` fails

@@ -53,16 +53,16 @@ class TDWEnum : public TDAttribute {
   // otherwise 0; whatever fails leaves the items as they were.
   // `length` bytes of `text` (embedded zero bytes included) become a new last item; 2 when the
   // list cannot grow.
-  int32_t AppendString(const char* text, size_t length);
-  int32_t AppendString(const char* cString);
-  int32_t AppendPStr(const uint8_t* pString);
+  [[nodiscard]] int32_t AppendString(const char* text, size_t length);
+  [[nodiscard]] int32_t AppendString(const char* cString);
+  [[nodiscard]] int32_t AppendPStr(const uint8_t* pString);
   // Inserts before item `index`; `index` equal to the count appends. 42 when the list cannot grow.
-  int32_t InsertStringAt(const char* cString, uint32_t index);
-  int32_t ReplaceStringAt(const char* cString, uint32_t index);
-  int32_t RemoveString(uint32_t index);
-  int32_t RemoveAllStrings();
+  [[nodiscard]] int32_t InsertStringAt(const char* cString, uint32_t index);
+  [[nodiscard]] int32_t ReplaceStringAt(const char* cString, uint32_t index);
+  [[nodiscard]] int32_t RemoveString(uint32_t index);
+  [[nodiscard]] int32_t RemoveAllStrings();
   // Makes room for `count` items in all; 2 when it cannot.
-  int32_t ReserveStringCount(uint32_t count);
+  [[nodiscard]] int32_t ReserveStringCount(uint32_t count);
   // AppendString(cString) and AppendPStr(pString); the status is dropped.
   TDWEnum& operator<<(const char* cString);
   TDWEnum& operator<<(const uint8_t* pString);

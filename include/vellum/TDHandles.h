@@ -129,7 +129,7 @@ class TD {
 
   int32_t HasName() const;
   // 0 and the name, or 42 for a null handle; `name` is left as it is when there is no name.
-  int32_t GetName(std::string* name) const;
+  [[nodiscard]] int32_t GetName(std::string* name) const;
   // The name as a Pascal string; the shared empty one when there is no name or no descriptor.
   const uint8_t* GetNamePStr() const;
   int32_t HasTypedef() const;
@@ -181,9 +181,9 @@ class TD {
   DataShapes FlatDataShape() const;
   // Writes the default value into uninitialised (onlyIfEmpty 0) or empty memory. 1 for a null
   // handle or null data; 2 when memory runs out.
-  int32_t InflateDefData(void* data, int32_t onlyIfEmpty, int32_t clearFirst, int32_t flags) const;
+  [[nodiscard]] int32_t InflateDefData(void* data, int32_t onlyIfEmpty, int32_t clearFirst, int32_t flags) const;
   // Turns a valid value into the default, reusing its memory. 1 for null data, 42 for a null handle.
-  int32_t ResetToDefaultData(void* data) const;
+  [[nodiscard]] int32_t ResetToDefaultData(void* data) const;
   // Give handle memory back through `allocator`; only data below `end` is touched. The result is
   // the number of bytes released.
   int32_t DeflateData(void* data, void* end, int32_t dispose, const HandleAllocationInterface& allocator) const;
@@ -192,12 +192,12 @@ class TD {
   // the debug stream. 0x100000 for a null handle.
   int32_t VerifyData(const void* data, const KoContext* context) const;
   // A deep copy into storage of the same type. 1 when either pointer is null, 42 for a null handle.
-  int32_t CopyData(const void* src, void* dst, const KoContext* context, int32_t flags) const;
+  [[nodiscard]] int32_t CopyData(const void* src, void* dst, const KoContext* context, int32_t flags) const;
   // Whether every value of this type survives conversion into `other`; false when either is null.
   bool ConversionIsLossless(const TD& other) const;
   // The kind's comparison of class data; 42 for a null handle. Kinds without one answer 0 and
   // leave *dataType as it is.
-  int32_t CompareClassData(int32_t how, const void* data, const TDR& other, TDR* dataType) const;
+  [[nodiscard]] int32_t CompareClassData(int32_t how, const void* data, const TDR& other, TDR* dataType) const;
 
   // The flattened form of `count` values at `data` (consecutive, DataSize apart): the bytes
   // written or read, with the stream's status in *status (42 for a null handle). Reading fills
@@ -238,7 +238,7 @@ class TDR : public TD {
 
   // Copies a value of this type into storage of type `dst`, converting it. 1 when either data
   // pointer is null, 42 when either handle is null; otherwise the families' status.
-  int32_t CopyDataConvert(const TD& dst, const void* src, void* dstData, int32_t flags) const;
+  [[nodiscard]] int32_t CopyDataConvert(const TD& dst, const void* src, void* dstData, int32_t flags) const;
 };
 
 // A writable handle: null, or a private, mutable descriptor that is not interned. It can never
@@ -261,15 +261,15 @@ class TDW : public TD {
 
   // Setters: 42 and no change for a null handle, otherwise 0 unless stated.
   // An empty or null text removes the name; 2 when a new name object cannot be allocated.
-  int32_t SetName(std::string_view name);
-  int32_t SetName(const uint8_t* cString);
-  int32_t SetNamePStr(const uint8_t* pString);
-  int32_t SetName(const TDWName& name);
-  int32_t RemoveName();
-  int32_t SetTypedef(const TDWTypedef& typedefLink);
-  int32_t RemoveTypedef();
-  int32_t SetNoSelectMask(int32_t mask);
-  int32_t SetGenericness(int32_t generic);
+  [[nodiscard]] int32_t SetName(std::string_view name);
+  [[nodiscard]] int32_t SetName(const uint8_t* cString);
+  [[nodiscard]] int32_t SetNamePStr(const uint8_t* pString);
+  [[nodiscard]] int32_t SetName(const TDWName& name);
+  [[nodiscard]] int32_t RemoveName();
+  [[nodiscard]] int32_t SetTypedef(const TDWTypedef& typedefLink);
+  [[nodiscard]] int32_t RemoveTypedef();
+  [[nodiscard]] int32_t SetNoSelectMask(int32_t mask);
+  [[nodiscard]] int32_t SetGenericness(int32_t generic);
   // The previous ephemeral flag (4 or 0); 42 for a null handle.
   int32_t EphemeralizeTD();
   int32_t UnephemeralizeTD();
@@ -284,7 +284,7 @@ class TDW : public TD {
   TDTraverseValue TraverseTDW(VisitTDW visit, void* context, ShouldRecurseTDW shouldRecurse);
 
   // As TDR::CopyDataConvert.
-  int32_t CopyDataConvert(const TD& dst, const void* src, void* dstData, int32_t flags) const;
+  [[nodiscard]] int32_t CopyDataConvert(const TD& dst, const void* src, void* dstData, int32_t flags) const;
 };
 
 // Handles that always hold null.

@@ -33,8 +33,8 @@ vellum::FXP Delta(const TD& type);
 int32_t RangeF64(const TD& type, double* min, double* max);
 void InitializeData(const TD& type, void* data);
 int32_t CompareData(const TD& type, const void* a, const void* b);
-int32_t ConvertFromNumeric(const TD& type, const TD& src, const void* srcData, void* dstData);
-int32_t ConvertToNumeric(const TD& type, const void* srcData, const TD& dst, void* dstData);
+[[nodiscard]] int32_t ConvertFromNumeric(const TD& type, const TD& src, const void* srcData, void* dstData);
+[[nodiscard]] int32_t ConvertToNumeric(const TD& type, const void* srcData, const TD& dst, void* dstData);
 int32_t MSDecimalDigitPos(const TD& type, const void* data);
 int32_t DecimalDigitsForAutoPrecision(const TD& type);
 int32_t SupportsUnits(const TD& type);
@@ -69,10 +69,10 @@ class TDNumericReadAccess {
   // One value of numeric type `src` into `dstData` of this type, or of this type into `dst`: 1
   // when converted, 0 (nothing written) when the pair cannot be converted this way. Units and
   // enumerations take no part; the last argument is unused.
-  int32_t ConvertFromNumeric(const TD& src, const void* srcData, void* dstData, int32_t = 0) const {
+  [[nodiscard]] int32_t ConvertFromNumeric(const TD& src, const void* srcData, void* dstData, int32_t = 0) const {
     return vellum::numeric::ConvertFromNumeric(Self(), src, srcData, dstData);
   }
-  int32_t ConvertToNumeric(const void* srcData, const TD& dst, void* dstData, int32_t = 0) const {
+  [[nodiscard]] int32_t ConvertToNumeric(const void* srcData, const TD& dst, void* dstData, int32_t = 0) const {
     return vellum::numeric::ConvertToNumeric(Self(), srcData, dst, dstData);
   }
   // floor(log10(|value|)); 0 for zero; for an infinity or NaN 7 on FloatExt, 3 on other kinds.
@@ -144,12 +144,12 @@ class TDWNumeric : public TDWTyped<TDRNumeric, TDWNumeric, TDW, NumericKind>,
   // The descriptor's own units object: changes through it change the descriptor.
   TDWUnits GetUnits() const { return TDWUnits(vellum::numeric::GetUnitsImpPtr(*this), 1); }
   // Each: 42 for a null handle or a kind without units; 0 otherwise. A null `units` removes them.
-  int32_t SetUnits(const TDWUnits& units);
-  int32_t SetUnits(const TDRUnits& units);
-  int32_t RemoveUnits();
+  [[nodiscard]] int32_t SetUnits(const TDWUnits& units);
+  [[nodiscard]] int32_t SetUnits(const TDRUnits& units);
+  [[nodiscard]] int32_t RemoveUnits();
   // Takes attributes of `src` by `mask`: 0x1 its enumeration, units, name and no-select flag,
   // 0x2 its typedef link. Nonzero when something was taken; 0 for a null handle.
-  int32_t CopyAttributes(const TDR& src, uint32_t mask);
+  [[nodiscard]] int32_t CopyAttributes(const TDR& src, uint32_t mask);
   // The pointer-sized-integer mark is not kept by the basic kinds; these do nothing.
   void SetIntPtrT();
   void ClearIntPtrT();
@@ -174,11 +174,11 @@ class TDWBasicNumeric : public TDWTyped<TDRBasicNumeric, TDWBasicNumeric, TDWNum
   TDWEnum GetEnum() const { return TDWEnum(vellum::numeric::GetEnumImpPtr(*this), 1); }
   // Each: 42 for a null handle, else 0. A null `enumeration` removes it. The type code of an
   // unsigned 8-, 16- or 32-bit integer follows (EnumUInt8 ... while it has one).
-  int32_t SetEnum(const TDWEnum& enumeration);
-  int32_t SetEnum(const TDREnum& enumeration);
-  int32_t RemoveEnum();
+  [[nodiscard]] int32_t SetEnum(const TDWEnum& enumeration);
+  [[nodiscard]] int32_t SetEnum(const TDREnum& enumeration);
+  [[nodiscard]] int32_t RemoveEnum();
   uint8_t GetNumFlags() const;
-  int32_t SetNumFlags(uint8_t numFlags);
+  [[nodiscard]] int32_t SetNumFlags(uint8_t numFlags);
 };
 
 // --- one pair per kind ---------------------------------------------------------------------------
@@ -278,7 +278,7 @@ const uint8_t* KoNumPrec();
 // Converts one value between two numeric types: 0; 1 when either pointer is null, 42 when either
 // handle is null, and 1 after a diagnostic when either type is not numeric. The flags are passed
 // to the conversion.
-int32_t ConvertNumTDR(const TDR& src, const void* srcData, const TDR& dst, void* dstData, int32_t flags);
+[[nodiscard]] int32_t ConvertNumTDR(const TDR& src, const void* srcData, const TDR& dst, void* dstData, int32_t flags);
 
 // 1 when either descriptor is not a basic numeric or has no enumeration, or when their items
 // differ at some index both have; 0 when one item list begins the other.

@@ -43,7 +43,7 @@ class TDWBoolean : public TDWTyped<TDRBoolean, TDWBoolean, TDW, BooleanKind> {
  public:
   using TDWTyped::TDWTyped;
   // Flag 0x0002, which the type string records; 42 for a null handle, else 0.
-  int32_t SetEventDiscardMask(int32_t mask);
+  [[nodiscard]] int32_t SetEventDiscardMask(int32_t mask);
 };
 
 class TDRBooleanU16 : public TDRTyped<TDRBooleanU16, TDWBooleanU16, TDR, BooleanU16Kind> {

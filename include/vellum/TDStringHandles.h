@@ -37,21 +37,21 @@ static_assert(sizeof(SubStringRec) == 24);
 
 // *dst becomes a copy of src (null: the empty string). A null *dst stays null for an empty source;
 // a handle whose length word already matches is reused without resizing.
-int32_t CopyLStr(LStrHandle src, LStrHandle* dst);
+[[nodiscard]] int32_t CopyLStr(LStrHandle src, LStrHandle* dst);
 // Copies into a preallocated fixed (bound < -1) or bounded (bound >= 0) string without resizing:
 // at most the bound's length, the rest of a fixed string zeroed. 1 after a diagnostic when *dst
 // holds fewer bytes than the bound needs, or a fixed string's length word is not its length;
 // nothing is written then.
-int32_t CopyBndFixString(LStrHandle src, LStrHandle* dst, int32_t bound);
+[[nodiscard]] int32_t CopyBndFixString(LStrHandle src, LStrHandle* dst, int32_t bound);
 // A substring into a variable string. A record that points into *dst itself is moved down and
 // the handle shrunk. 1 for a null record, a negative length, or a non-empty record with a null
 // data pointer or a stride other than 1.
-int32_t CopySString(const SubStringRec* rec, LStrHandle* dst);
+[[nodiscard]] int32_t CopySString(const SubStringRec* rec, LStrHandle* dst);
 // As CopyBndFixString with the record's bytes; 1 after a diagnostic for a stride other than 1,
 // 2 after a diagnostic when the preallocated handle is too small.
-int32_t CopySBndFixString(const SubStringRec* rec, LStrHandle* dst, int32_t bound);
+[[nodiscard]] int32_t CopySBndFixString(const SubStringRec* rec, LStrHandle* dst, int32_t bound);
 // *dst becomes a copy of src, or the empty path for a null src. On failure (2) *dst is unchanged.
-int32_t CopyPath(Path src, Path* dst);
+[[nodiscard]] int32_t CopyPath(Path src, Path* dst);
 
 // --- kinds ---------------------------------------------------------------------------------------
 
@@ -96,7 +96,7 @@ class TDWStringBase : public TDWTyped<TDRStringBase, TDWStringBase, TDW, StringB
   using TDWTyped::TDWTyped;
   int32_t GetBound() const;
   // 42 for a null handle, else 0.
-  int32_t SetBound(int32_t bound);
+  [[nodiscard]] int32_t SetBound(int32_t bound);
 };
 
 class TDRString;

@@ -64,7 +64,7 @@ class TDWTagBase : public TDWTyped<TDRTagBase, TDWTagBase, TDWStringBase, TagBas
   TagType GetTagType() const;
   // 0; 42 for a null handle; 1 after a diagnostic, with no change, for a change to or from the
   // user-defined kind.
-  int32_t SetTagType(TagType tagType);
+  [[nodiscard]] int32_t SetTagType(TagType tagType);
 };
 
 class TDRTag : public TDRTyped<TDRTag, TDWTag, TDRTagBase, TagKind> {
@@ -109,8 +109,8 @@ class TDWUserDefinedTag : public TDWTyped<TDRUserDefinedTag, TDWUserDefinedTag, 
   const uint8_t* GetTagClass() const;
   // Each: 0, 42 for a null handle, 2 when memory runs out (class unchanged). Null or empty
   // removes the class; a CStr longer than 255 bytes keeps its first 255.
-  int32_t SetTagClass(const uint8_t* tagClassPStr);
-  int32_t SetTagClassCStr(const uint8_t* tagClassCStr);
+  [[nodiscard]] int32_t SetTagClass(const uint8_t* tagClassPStr);
+  [[nodiscard]] int32_t SetTagClassCStr(const uint8_t* tagClassCStr);
 };
 
 // The shared default tag (kind 1, variable length, no name), built on first use.

@@ -45,7 +45,7 @@ class TDRUnits : public TDAttribute {
   uint32_t GetNumUnits() const;
   // The index-th entry in key order: 0; 1 for an index out of range or a null `pair`; 42 for a
   // null handle or an object without storage.
-  int32_t GetUnits(uint32_t index, TDUnitPair* pair) const;
+  [[nodiscard]] int32_t GetUnits(uint32_t index, TDUnitPair* pair) const;
   // The key's exponent (negative keys normalised as the setters do); 0 when absent, for a key
   // above 9 and for a null handle.
   int16_t GetExponent(TDBaseUnits unit) const;
@@ -69,7 +69,7 @@ class TDWUnits : public TDAttribute {
 
   TDUnitsImpPtr GetUnitsImpPtr() const;
   uint32_t GetNumUnits() const;
-  int32_t GetUnits(uint32_t index, TDUnitPair* pair) const;
+  [[nodiscard]] int32_t GetUnits(uint32_t index, TDUnitPair* pair) const;
   int16_t GetExponent(TDBaseUnits unit) const;
   int32_t HasPolyUnits() const;
   bool IsSane() const;
@@ -77,11 +77,11 @@ class TDWUnits : public TDAttribute {
   // Setters: 42 for a null handle or an object without storage; 1 for a key above 9 (nothing
   // changes). A negative key k stands for k % 10 (truncated): -12 is polymorphic unit 2, -10 is
   // radians. SetUnit with exponent 0 removes the key.
-  int32_t SetUnit(TDBaseUnits unit, int16_t exponent);
+  [[nodiscard]] int32_t SetUnit(TDBaseUnits unit, int16_t exponent);
   // Adds `delta` to the key's exponent; a result of 0 removes the key. 1 when the result would
   // not fit in 16 bits (nothing changes).
-  int32_t IncreaseExponent(TDBaseUnits unit, int16_t delta);
-  int32_t ClearAllUnits();
+  [[nodiscard]] int32_t IncreaseExponent(TDBaseUnits unit, int16_t delta);
+  [[nodiscard]] int32_t ClearAllUnits();
   // IncreaseExponent(unit, exponent); the status is dropped.
   TDWUnits& operator<<(std::pair<TDBaseUnits, int16_t> power);
 

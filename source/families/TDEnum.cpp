@@ -381,12 +381,12 @@ int32_t TDWEnum::ReserveStringCount(uint32_t count) {
 }
 
 TDWEnum& TDWEnum::operator<<(const char* cString) {
-  AppendString(cString);
+  static_cast<void>(AppendString(cString));  // a chain drops statuses
   return *this;
 }
 
 TDWEnum& TDWEnum::operator<<(const uint8_t* pString) {
-  AppendPStr(pString);
+  static_cast<void>(AppendPStr(pString));
   return *this;
 }
 

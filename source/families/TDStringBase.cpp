@@ -616,7 +616,8 @@ int32_t TDPathImp::DeflateData(void* data, void* end, int32_t dispose, const Han
   if (dispose != 0) {
     FDestroyPath(&path);
   } else {
-    CopyPath(nullptr, &path);
+    // Kept but emptied; when even that fails the old path stays, which is still a valid datum.
+    static_cast<void>(CopyPath(nullptr, &path));
   }
   Store(data, path);
   return 0;

@@ -320,7 +320,7 @@ int32_t TDWUnits::ClearAllUnits() {
 }
 
 TDWUnits& TDWUnits::operator<<(std::pair<TDBaseUnits, int16_t> power) {
-  IncreaseExponent(power.first, power.second);
+  static_cast<void>(IncreaseExponent(power.first, power.second));  // a chain drops statuses
   return *this;
 }
 

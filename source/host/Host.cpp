@@ -135,7 +135,7 @@ int32_t UnflattenData(const TDR& type, std::span<const uint8_t> bytes, void* dat
     (VELLUM_DEBUG(2) << in.BytesLeft() << " byte(s) follow the value, which ends at byte " << in.Position())
         .Process();
     // The caller asked for exactly one value: what it holds now is not what the bytes say.
-    type.ResetToDefaultData(data);
+    static_cast<void>(type.ResetToDefaultData(data));  // the refusal's status says more
     return kStatusCorruptData;
   }
   return kStatusNoError;
