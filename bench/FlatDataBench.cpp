@@ -5,6 +5,7 @@
 // and reused, so that what is measured is the work, not fresh pages from the kernel.
 #include <benchmark/benchmark.h>
 
+#include <cstdlib>
 #include <cstring>
 #include <string>
 #include <vector>
