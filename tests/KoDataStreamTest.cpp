@@ -179,8 +179,8 @@ TEST(KoDataStreamTest, StreamsUseTheCallersContext) {
   const PersistTDData persist(0x08208003, context, kPersistDeferIndices);
   OutputBuf out;
   InputBuf in(nullptr, 0);
-  TDDataWriter writer(&persist, &out, &kBigEndian);
-  TDDataReader reader(&persist, &in, &kBigEndian, 7);
+  KoDataWriter writer(&persist, &out, &kBigEndian, 0);
+  KoDataReader reader(&persist, &in, &kBigEndian, 7);
   EXPECT_EQ(writer.GetPersistTDData(), &persist);
   EXPECT_EQ(reader.GetPersistTDData(), &persist);
   EXPECT_EQ(writer.GetVersion(), 0x08208003u);

@@ -299,18 +299,18 @@ TEST_F(TD80ReadWriteTest, ClustersTooWideToLoadAreNotSaved) {
 }
 
 TEST_F(TD80ReadWriteTest, LoadTableIndicesOutsideTheTableAreNull) {
-  const std::vector<uint8_t> bytes = BytesFromHex("00 05 00 03 00 00 00");
-  InputBuf in(bytes.data(), bytes.size());
-  TDDataReader reader(nullptr, &in, nullptr);
-  ASSERT_EQ(reader.ConstructEltTD(), GetiL());
-  EXPECT_EQ(reader.RetrieveTDFromLoadTableByIndex(0), GetiL());
+  // One record; entries at index 0, at 1 (one past the table) and at 32768 (a four-byte index).
+  const std::vector<uint8_t> bytes = BytesFromHex("00 00 00 01 00 05 00 03 00 00 03 00 00 00 01 80 00 80 00");
   DebugCapture capture;
-  EXPECT_FALSE(reader.RetrieveTDFromLoadTableByIndex(3));
-  EXPECT_FALSE(reader.RetrieveTDFromLoadTableByIndex(-1));
-  EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"Invalid type index: 3, 1", "Invalid type index: -1, 1"}));
-  // Read from the stream: index 0 is the one record, the next one is outside and null.
-  EXPECT_EQ(reader.GetTypeRef(), GetiL());
-  EXPECT_FALSE(reader.GetTypeRef());
+  TMTypeList list;
+  ASSERT_EQ(UnFlattenListOfTypes(nullptr, bytes.data(), static_cast<uint32_t>(bytes.size()), &list, nullptr, 0,
+                                 nullptr),
+            kStatusNoError);
+  ASSERT_EQ(list.GetNumTypes(), 3);
+  EXPECT_EQ(list.GetType(0), GetiL());
+  EXPECT_FALSE(list.GetType(1));
+  EXPECT_FALSE(list.GetType(2));
+  EXPECT_TRUE(capture.Texts().empty());
 }
 
 TEST_F(TD80ReadWriteTest, NullOutputHandleIsRefused) {

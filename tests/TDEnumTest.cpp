@@ -1,6 +1,7 @@
 // Enumerations: editing and its statuses, hash, equality, the prefix comparison and the sorting
 // order, the flattened form with its pad byte and its reader on hostile or truncated bytes, the
-// dump, interning and running out of memory.
+// dump, interning and running out of memory. Enumerations travel only inside the record of an
+// unsigned integer, so their stored form is checked there.
 #include <gtest/gtest.h>
 
 #include <algorithm>
@@ -14,6 +15,7 @@
 #include "runtime/DSMemory.h"
 #include "vellum/TypeStrings.h"
 #include "vellum/TDEnumHandles.h"
+#include "vellum/TDNumericHandles.h"
 #include "vellum.h"
 
 namespace {
@@ -22,6 +24,11 @@ using Bytes = std::vector<uint8_t>;
 using Items = std::vector<std::string>;
 
 constexpr uint32_t kVersion = 0x22308000;
+constexpr uint8_t kEnumUInt8 = 0x15;
+// The record count, the record's size field and its code word come before the enumeration part.
+constexpr size_t kEnumPartOffset = 8;
+// The item count is stored in 16 bits.
+constexpr uint32_t kMaxFlatItems = 0xFFFF;
 const BigEndianizer kBigEndian;
 
 class TDEnumTest : public TypeSystemTest {};
@@ -42,34 +49,47 @@ Items ItemsOf(const Handle& enumeration) {
   return items;
 }
 
-Bytes Flatten(const TDEnumImp& enumeration, int32_t* status = nullptr) {
+// The type string of one EnumUInt8 record that carries `enumPart`, then the flag byte 0 and the
+// list's one entry.
+Bytes RecordWith(const Bytes& enumPart) {
+  const size_t size = 4 + enumPart.size() + 1;
+  Bytes bytes = {0x00, 0x00, 0x00, 0x01, static_cast<uint8_t>(size >> 8), static_cast<uint8_t>(size),
+                 0x00, kEnumUInt8};
+  for (const uint8_t byte : enumPart) bytes.push_back(byte);
+  for (const uint8_t byte : {0x00, 0x00, 0x01, 0x00, 0x00}) bytes.push_back(byte);
+  return bytes;
+}
+
+Bytes Saved(const TDR& type, int32_t* status = nullptr) {
   const PersistTDData persist(kVersion);
-  OutputBuf out;
-  TDDataWriter writer(&persist, &out, &kBigEndian);
-  const int32_t result = enumeration.Flatten(&writer);
-  EXPECT_EQ(result, writer.GetError());
+  UHandle h = nullptr;
+  const int32_t result = FlattenOneType(&persist, type, &h, &kBigEndian);
   if (status != nullptr) *status = result;
-  return out.Bytes();
+  else EXPECT_EQ(result, 0);
+  if (h == nullptr) return {};
+  Bytes bytes(*h, *h + DSGetHandleSize(h));
+  DSDisposeHandle(h);
+  return bytes;
 }
 
-int32_t FlatSize(const TDEnumImp& enumeration) {
-  const PersistTDData persist(kVersion);
-  OutputBuf out;
-  TDDataWriter writer(&persist, &out, &kBigEndian);
-  int32_t size = 100;  // the size is added to what the caller has counted so far
-  enumeration.AddFlatSize(&size, &writer);
-  return size - 100;
-}
+struct Loaded {
+  int32_t status = -1;  // the reader's error, which the enumeration reader's failure becomes
+  TDR type;
+  size_t consumed = 0;
+};
 
-int32_t UnFlatten(const Bytes& bytes, TDEnumImp* enumeration, size_t* consumed = nullptr) {
+Loaded Load(const Bytes& bytes) {
   const PersistTDData persist(kVersion);
   InputBuf in(bytes.data(), bytes.size());
-  TDDataReader reader(&persist, &in, &kBigEndian, 0);
-  const int32_t status = enumeration->UnFlatten(&reader);
-  EXPECT_EQ(status, reader.GetError());
-  if (consumed != nullptr) *consumed = reader.Position();
-  return status;
+  KoDataReader reader(&persist, &in, &kBigEndian, 0);
+  Loaded loaded;
+  loaded.type = reader.ReadTD();
+  loaded.status = reader.GetError();
+  loaded.consumed = reader.Position();
+  return loaded;
 }
+
+TDREnum EnumOf(const TDR& type) { return TDRBasicNumeric(type.GetImpPtr(), 1).GetEnum(); }
 
 int32_t Sign(int32_t value) { return (value > 0) - (value < 0); }
 
@@ -188,17 +208,18 @@ TEST_F(TDEnumTest, EditingANullHandleOrAnObjectWithoutStorageGives42) {
   EXPECT_FALSE(TDREnum().CheckOut());
   EXPECT_FALSE(TDREnum().IsSane());
 
-  int32_t status = 0;
-  EXPECT_EQ(Flatten(*withoutStorage.GetEnumImpPtr(), &status), Bytes{});
-  EXPECT_EQ(status, kStatusNullHandle);
-  EXPECT_EQ(FlatSize(*withoutStorage.GetEnumImpPtr()), 0);
-  EXPECT_EQ(UnFlatten({0x00, 0x00}, withoutStorage.GetEnumImpPtr().get()), kStatusNullHandle);
   DebugCapture capture;
   withoutStorage.PrintDebugStr();
   EXPECT_TRUE(capture.Messages().empty());
-  // Without items it interns as the empty enumeration, which has its storage.
+  // Without items it interns as the empty enumeration, which has its storage; a number that
+  // carries it is saved with the empty enumeration.
   EXPECT_EQ(withoutStorage.CheckIn(), TDWEnum().CheckIn());
   EXPECT_TRUE(withoutStorage.CheckIn().IsSane());
+  TDWUInt8 number;
+  ASSERT_EQ(number.SetEnum(withoutStorage), 0);
+  const TDR saved = number.CheckIn();
+  EXPECT_EQ(EnumOf(saved), TDWEnum().CheckIn());
+  EXPECT_EQ(Saved(saved), RecordWith({0x00, 0x00}));
 }
 
 // ---- hash, equality, orders ----
@@ -216,7 +237,6 @@ TEST_F(TDEnumTest, EqualItemsInternToOneObject) {
   const TDREnum first = Make({"a", "b"}).CheckIn();
   ASSERT_TRUE(first);
   EXPECT_EQ(Make({"a", "b"}).CheckIn(), first);
-  EXPECT_EQ(first.GetEnumImpPtr()->IsEqual(*Make({"a", "b"}).GetEnumImpPtr()), 1);
   EXPECT_NE(Make({"b", "a"}).CheckIn(), first);
   EXPECT_NE(Make({"a", "b", ""}).CheckIn(), first);
   EXPECT_NE(Make({"a", "B"}).CheckIn(), first);
@@ -225,9 +245,6 @@ TEST_F(TDEnumTest, EqualItemsInternToOneObject) {
   const TDWEnum zeroB = Make({std::string("a\0y", 3)});
   EXPECT_EQ(zeroA.GetHashValue(), zeroB.GetHashValue());
   EXPECT_NE(zeroA.CheckIn(), zeroB.CheckIn());
-
-  const TDWName name(PStr("a"));
-  EXPECT_EQ(first.GetEnumImpPtr()->IsEqual(*name.GetAttributeImpPtr()), 0);
 }
 
 struct PrefixCase {
@@ -276,8 +293,14 @@ TEST_F(TDEnumTest, PrefixComparisonWithoutTwoEnumerations) {
 struct OrderCase {
   Items a;
   Items b;
-  int32_t order;  // CompareForSorting(a, b)
+  int32_t order;  // the order of two numbers that differ only in these enumerations
 };
+
+// Private numbers, so that equal enumerations are still compared rather than found to be one
+// object.
+int32_t EnumOrder(const Items& a, const Items& b) {
+  return TDWUInt8(Make(a), nullptr).CompareForSorting(TDWUInt8(Make(b), nullptr));
+}
 
 const OrderCase kOrderCases[] = {
     {{"a", "b"}, {"a", "b"}, 0},
@@ -293,12 +316,10 @@ const OrderCase kOrderCases[] = {
 TEST_F(TDEnumTest, SortingOrder) {
   for (const OrderCase& c : kOrderCases) {
     SCOPED_TRACE(testing::PrintToString(c.a) + " vs " + testing::PrintToString(c.b));
-    const TDWEnum a = Make(c.a);
-    const TDWEnum b = Make(c.b);
-    EXPECT_EQ(Sign(a.GetEnumImpPtr()->CompareForSorting(*b.GetEnumImpPtr())), Sign(c.order));
-    EXPECT_EQ(Sign(b.GetEnumImpPtr()->CompareForSorting(*a.GetEnumImpPtr())), -Sign(c.order));
+    EXPECT_EQ(Sign(EnumOrder(c.a, c.b)), Sign(c.order));
+    EXPECT_EQ(Sign(EnumOrder(c.b, c.a)), -Sign(c.order));
   }
-  EXPECT_EQ(Make({"a", "b", "c"}).GetEnumImpPtr()->CompareForSorting(*Make({"z"}).GetEnumImpPtr()), 2);
+  EXPECT_EQ(EnumOrder({"a", "b", "c"}, {"z"}), 2);
 }
 
 // ---- flattened form ----
@@ -321,60 +342,63 @@ const FlatCase kFlatCases[] = {
 TEST_F(TDEnumTest, FlattenedBytes) {
   for (const FlatCase& c : kFlatCases) {
     SCOPED_TRACE(c.name);
-    const TDWEnum enumeration = Make(c.items);
-    int32_t status = -1;
-    EXPECT_EQ(Flatten(*enumeration.GetEnumImpPtr(), &status), c.bytes);
-    EXPECT_EQ(status, 0);
-    EXPECT_EQ(FlatSize(*enumeration.GetEnumImpPtr()), static_cast<int32_t>(c.bytes.size()));
+    const TDRUInt8 number(Make(c.items), nullptr);
+    ASSERT_TRUE(number);
+    // The record's size field counts the enumeration part as its flattened size.
+    const Bytes record = RecordWith(c.bytes);
+    EXPECT_EQ(Saved(number), record);
 
-    TDWEnum back = Make({"stale"});  // reading replaces what was there
-    Bytes followed = c.bytes;
+    Bytes followed = record;
     followed.push_back(0xAB);
-    size_t consumed = 0;
-    EXPECT_EQ(UnFlatten(followed, back.GetEnumImpPtr().get(), &consumed), 0);
-    EXPECT_EQ(consumed, c.bytes.size());
-    EXPECT_EQ(ItemsOf(back), c.items);
-    EXPECT_EQ(back.CheckIn(), enumeration.CheckIn());
+    const Loaded loaded = Load(followed);
+    EXPECT_EQ(loaded.status, 0);
+    EXPECT_EQ(loaded.consumed, record.size());
+    EXPECT_EQ(loaded.type, number);
+    EXPECT_EQ(ItemsOf(EnumOf(loaded.type)), c.items);
   }
 }
 
 TEST_F(TDEnumTest, ReadingSkipsWhateverPadByteIsThere) {
-  TDWEnum enumeration;
-  size_t consumed = 0;
-  EXPECT_EQ(UnFlatten({0x00, 0x01, 0x02, 0x61, 0x62, 0x7F, 0x55}, enumeration.GetEnumImpPtr().get(), &consumed), 0);
-  EXPECT_EQ(consumed, 6u);
-  EXPECT_EQ(ItemsOf(enumeration), (Items{"ab"}));
+  const Loaded loaded = Load(RecordWith({0x00, 0x01, 0x02, 0x61, 0x62, 0x7F}));
+  ASSERT_EQ(loaded.status, 0);
+  EXPECT_EQ(ItemsOf(EnumOf(loaded.type)), (Items{"ab"}));
+  // Saved again, the pad byte is zero.
+  EXPECT_EQ(Saved(loaded.type), RecordWith({0x00, 0x01, 0x02, 0x61, 0x62, 0x00}));
 }
 
 TEST_F(TDEnumTest, TruncatedInputGivesAStatus) {
-  const Bytes whole = kFlatCases[1].bytes;
-  for (size_t length = 0; length < whole.size(); ++length) {
+  const Bytes whole = RecordWith(kFlatCases[1].bytes);
+  for (size_t length = 0; length < kFlatCases[1].bytes.size(); ++length) {
     SCOPED_TRACE(length);
     LiveBlockCheck blocks;
-    TDWEnum enumeration = Make({"old"});
-    const int32_t hashBefore = enumeration.GetHashValue();
-    EXPECT_EQ(UnFlatten(Bytes(whole.begin(), whole.begin() + length), enumeration.GetEnumImpPtr().get()),
-              kStatusCorruptData);
-    EXPECT_EQ(ItemsOf(enumeration), (Items{"old"}));
-    EXPECT_EQ(enumeration.GetHashValue(), hashBefore);
+    const Loaded loaded = Load(Bytes(whole.begin(), whole.begin() + kEnumPartOffset + length));
+    EXPECT_EQ(loaded.status, kStatusCorruptData);
+    EXPECT_FALSE(loaded.type);
   }
+  // A huge count with one item behind it stops at the end of the bytes.
   LiveBlockCheck blocks;
-  TDWEnum enumeration;
-  EXPECT_EQ(UnFlatten({0xFF, 0xFF, 0x01, 0x61, 0x01}, enumeration.GetEnumImpPtr().get()), kStatusCorruptData);
-  EXPECT_EQ(enumeration.GetNumStrings(), 0u);
+  const Bytes huge = RecordWith({0xFF, 0xFF, 0x01, 0x61, 0x01});
+  const Loaded loaded = Load(Bytes(huge.begin(), huge.begin() + kEnumPartOffset + 5));
+  EXPECT_EQ(loaded.status, kStatusCorruptData);
+  EXPECT_FALSE(loaded.type);
 }
 
 TEST_F(TDEnumTest, MoreItemsThanTheCountCanHoldDoNotFlatten) {
   TDWEnum enumeration;
-  ASSERT_EQ(enumeration.ReserveStringCount(TDEnumImp::kMaxFlatItems + 1), 0);
-  for (uint32_t i = 0; i < TDEnumImp::kMaxFlatItems; ++i) ASSERT_EQ(enumeration.AppendString("", 0), 0);
-  Bytes bytes = Flatten(*enumeration.GetEnumImpPtr());
-  EXPECT_EQ(bytes.size(), 2u + TDEnumImp::kMaxFlatItems + 1);  // the largest that can be stored
+  ASSERT_EQ(enumeration.ReserveStringCount(kMaxFlatItems + 1), 0);
+  for (uint32_t i = 0; i < kMaxFlatItems; ++i) ASSERT_EQ(enumeration.AppendString("", 0), 0);
+  // The largest that can be stored: the count, one length byte per item and a pad byte, in a
+  // record long enough for a four-byte size field.
+  Bytes bytes = Saved(TDRUInt16(enumeration, nullptr));
+  const size_t part = 2u + kMaxFlatItems + 1;
+  ASSERT_EQ(bytes.size(), 4u + 4u + 2u + part + 1u + 4u);
+  EXPECT_EQ(Bytes(bytes.begin(), bytes.begin() + 12),
+            (Bytes{0x00, 0x00, 0x00, 0x01, 0x80, 0x01, 0x00, 0x09, 0x00, 0x16, 0xFF, 0xFF}));
 
   ASSERT_EQ(enumeration.AppendString("", 0), 0);
   DebugCapture capture;
   int32_t status = 0;
-  bytes = Flatten(*enumeration.GetEnumImpPtr(), &status);
+  bytes = Saved(TDRUInt16(enumeration, nullptr), &status);
   EXPECT_EQ(status, kStatusBadArgument);
   EXPECT_TRUE(bytes.empty());
   ASSERT_FALSE(capture.Messages().empty());
@@ -395,9 +419,13 @@ TEST_F(TDEnumTest, DebugDump) {
       EXPECT_EQ(m.module, "TDEnum");
     }
   }
+  // Inside a number's dump the enumeration's lines carry the prefix the number's lines carry.
   DebugCapture capture;
-  Make({}).GetEnumImpPtr()->PrintDebugStr(PStr(">"));
-  EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"># enum elements = 0", ">enum = {", ">\t}"}));
+  TDRUInt8(Make({}), nullptr).PrintDebugStr(PStr(">"));
+  const std::vector<std::string> texts = capture.Texts();
+  const std::vector<std::string> enumLines = {">\t# enum elements = 0", ">\tenum = {", ">\t\t}"};
+  EXPECT_NE(std::search(texts.begin(), texts.end(), enumLines.begin(), enumLines.end()), texts.end())
+      << testing::PrintToString(texts);
 }
 
 // ---- interning ----
@@ -439,15 +467,34 @@ TEST_F(TDEnumTest, EditingRunningOutOfMemoryChangesNothing) {
 }
 
 TEST_F(TDEnumTest, UnFlattenRunningOutOfMemory) {
-  const Bytes bytes = {0x00, 0x03, 0x03, 'o', 'n', 'e', 0x03, 't', 'w', 'o', 0x05, 't', 'h', 'r', 'e', 'e'};
-  SweepAllocationFailures({"old"}, {kStatusOutOfMemory}, {"one", "two", "three"}, [&](TDWEnum& e) {
-    const PersistTDData persist(kVersion);
-    InputBuf in(bytes.data(), bytes.size());
-    TDDataReader reader(&persist, &in, &kBigEndian, 0);
-    const int32_t status = e.GetEnumImpPtr()->UnFlatten(&reader);
-    EXPECT_EQ(reader.GetError(), status);
-    return status;
-  });
+  const Bytes bytes =
+      RecordWith({0x00, 0x03, 0x03, 'o', 'n', 'e', 0x03, 't', 'w', 'o', 0x05, 't', 'h', 'r', 'e', 'e'});
+  // Interned first, so that a load that fails leaves no half-interned member behind.
+  const TDRUInt8 expected(Make({"one", "two", "three"}), nullptr);
+  int32_t storageRefusals = 0;
+  for (int64_t nth = 1;; ++nth) {
+    SCOPED_TRACE(nth);
+    ASSERT_LT(nth, 100) << "never succeeded";
+    LiveBlockCheck blocks;
+    Loaded loaded;
+    bool fired = false;
+    {
+      ScopedAllocationFailure failure(nth);
+      loaded = Load(bytes);
+      fired = failure.Fired();
+    }
+    if (!fired || loaded.type) {  // some room is only reserved ahead, and the load does without
+      EXPECT_EQ(loaded.status, 0);
+      EXPECT_EQ(loaded.type, expected);
+      if (!fired) break;
+      continue;
+    }
+    // An enumeration made without its storage refuses to be read into (42); any other failure,
+    // the items' among them, is out of memory.
+    if (loaded.status == kStatusNullHandle) ++storageRefusals;
+    else EXPECT_EQ(loaded.status, kStatusOutOfMemory);
+  }
+  EXPECT_LE(storageRefusals, 1);
 }
 
 TEST_F(TDEnumTest, CheckInAndCloneRunningOutOfMemory) {

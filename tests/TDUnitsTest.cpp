@@ -1,7 +1,10 @@
 // Units: key normalisation and the setters, hash, equality and sorting order, the flattened form
 // and its reader on hostile or truncated bytes, the dump, interning and running out of memory.
+// Units travel only inside the record of a floating or complex number, so their stored form is
+// checked there.
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstdint>
 #include <limits>
 #include <string>
@@ -13,6 +16,7 @@
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
 #include "vellum/TypeStrings.h"
+#include "vellum/TDNumericHandles.h"
 #include "vellum/TDUnitsHandles.h"
 #include "vellum.h"
 
@@ -22,6 +26,9 @@ using Bytes = std::vector<uint8_t>;
 using Powers = std::vector<std::pair<TDBaseUnits, int16_t>>;
 
 constexpr uint32_t kVersion = 0x22308000;
+constexpr uint8_t kFloat64WithUnits = 0x1A;
+// The record count, the record's size field and its code word come before the units part.
+constexpr size_t kUnitsPartOffset = 8;
 const BigEndianizer kBigEndian;
 
 class TDUnitsTest : public TypeSystemTest {};
@@ -32,7 +39,8 @@ TDWUnits Make(const Powers& powers) {
   return units;
 }
 
-Powers PowersOf(const TDWUnits& units) {
+template <class Handle>
+Powers PowersOf(const Handle& units) {
   Powers powers;
   for (uint32_t i = 0; i < units.GetNumUnits(); ++i) {
     TDUnitPair pair;
@@ -42,34 +50,45 @@ Powers PowersOf(const TDWUnits& units) {
   return powers;
 }
 
-Bytes Flatten(const TDUnitsImp& units, int32_t* status = nullptr) {
-  const PersistTDData persist(kVersion);
-  OutputBuf out;
-  TDDataWriter writer(&persist, &out, &kBigEndian);
-  const int32_t result = units.Flatten(&writer);
-  EXPECT_EQ(result, writer.GetError());
-  if (status != nullptr) *status = result;
-  return out.Bytes();
+// The type string of one Float64 record that carries `unitsPart`, then the flag byte 0 and the
+// list's one entry.
+Bytes RecordWith(const Bytes& unitsPart) {
+  const size_t size = 4 + unitsPart.size() + 1;
+  Bytes bytes = {0x00, 0x00, 0x00, 0x01, static_cast<uint8_t>(size >> 8), static_cast<uint8_t>(size),
+                 0x00, kFloat64WithUnits};
+  for (const uint8_t byte : unitsPart) bytes.push_back(byte);
+  for (const uint8_t byte : {0x00, 0x00, 0x01, 0x00, 0x00}) bytes.push_back(byte);
+  return bytes;
 }
 
-int32_t FlatSize(const TDUnitsImp& units) {
+Bytes Saved(const TDR& type) {
   const PersistTDData persist(kVersion);
-  OutputBuf out;
-  TDDataWriter writer(&persist, &out, &kBigEndian);
-  int32_t size = 100;  // the size is added to what the caller has counted so far
-  units.AddFlatSize(&size, &writer);
-  return size - 100;
+  UHandle h = nullptr;
+  EXPECT_EQ(FlattenOneType(&persist, type, &h, &kBigEndian), 0);
+  if (h == nullptr) return {};
+  Bytes bytes(*h, *h + DSGetHandleSize(h));
+  DSDisposeHandle(h);
+  return bytes;
 }
 
-int32_t UnFlatten(const Bytes& bytes, TDUnitsImp* units, size_t* consumed = nullptr) {
+struct Loaded {
+  int32_t status = -1;  // the reader's error, which the units reader's failure becomes
+  TDR type;
+  size_t consumed = 0;
+};
+
+Loaded Load(const Bytes& bytes) {
   const PersistTDData persist(kVersion);
   InputBuf in(bytes.data(), bytes.size());
-  TDDataReader reader(&persist, &in, &kBigEndian, 0);
-  const int32_t status = units->UnFlatten(&reader);
-  EXPECT_EQ(status, reader.GetError());
-  if (consumed != nullptr) *consumed = reader.Position();
-  return status;
+  KoDataReader reader(&persist, &in, &kBigEndian, 0);
+  Loaded loaded;
+  loaded.type = reader.ReadTD();
+  loaded.status = reader.GetError();
+  loaded.consumed = reader.Position();
+  return loaded;
 }
+
+TDRUnits UnitsOf(const TDR& type) { return TDRNumeric(type.GetImpPtr(), 1).GetUnits(); }
 
 int32_t Sign(int32_t value) { return (value > 0) - (value < 0); }
 
@@ -204,20 +223,21 @@ TEST_F(TDUnitsTest, AnObjectWithoutStorageHasNoUnits) {
   EXPECT_EQ(units.GetNumUnits(), 0u);
   EXPECT_EQ(units.GetHashValue(), 0);
 
-  int32_t status = 0;
-  EXPECT_EQ(Flatten(*units.GetUnitsImpPtr(), &status), Bytes{});
-  EXPECT_EQ(status, kStatusNullHandle);
-  EXPECT_EQ(FlatSize(*units.GetUnitsImpPtr()), 0);
-  EXPECT_EQ(UnFlatten({0x00, 0x00}, units.GetUnitsImpPtr().get()), kStatusNullHandle);
   DebugCapture capture;
   units.PrintDebugStr();
   EXPECT_TRUE(capture.Messages().empty());
 
-  // It has no units, so it interns as the empty units, which have their storage.
+  // It has no units, so it interns as the empty units, which have their storage; a number that
+  // carries it is saved with empty units.
   const TDRUnits interned = units.CheckIn();
   EXPECT_EQ(interned, TDWUnits().CheckIn());
   EXPECT_TRUE(interned.IsSane());
   EXPECT_TRUE(units.Clone().IsSane());
+  TDWFloat64 number;
+  ASSERT_EQ(number.SetUnits(units), 0);
+  const TDR saved = number.CheckIn();
+  EXPECT_EQ(UnitsOf(saved), interned);
+  EXPECT_EQ(Saved(saved), RecordWith({0x00, 0x00}));
 }
 
 // ---- hash, equality, order ----
@@ -253,21 +273,28 @@ TEST_F(TDUnitsTest, Equality) {
     SCOPED_TRACE(c.name);
     const TDWUnits a = Make(c.a);
     const TDWUnits b = Make(c.b);
-    EXPECT_EQ(a.GetUnitsImpPtr()->IsEqual(*b.GetUnitsImpPtr()), c.equal ? 1 : 0);
-    EXPECT_EQ(b.GetUnitsImpPtr()->IsEqual(*a.GetUnitsImpPtr()), c.equal ? 1 : 0);
+    // The private objects themselves, before interning can make them one.
+    const TDRUnits privateA(a.GetUnitsImpPtr(), 1);
+    const TDRUnits privateB(b.GetUnitsImpPtr(), 1);
+    EXPECT_EQ(privateA.UnitsMatch(privateB), c.equal ? 1 : 0);
+    EXPECT_EQ(privateB.UnitsMatch(privateA), c.equal ? 1 : 0);
     EXPECT_EQ(a.CheckIn() == b.CheckIn(), c.equal);
     EXPECT_EQ(a.CheckIn().UnitsMatch(b.CheckIn()), c.equal ? 1 : 0);
+    EXPECT_EQ(TDRFloat64(a, nullptr) == TDRFloat64(b, nullptr), c.equal);
   }
-  const TDWName name(reinterpret_cast<const uint8_t*>("label"));
-  EXPECT_EQ(Make({}).GetUnitsImpPtr()->IsEqual(*name.GetAttributeImpPtr()), 0);
 }
 
 struct OrderCase {
   const char* name;
   Powers a;
   Powers b;
-  int32_t order;  // CompareForSorting(a, b)
+  int32_t order;  // the order of two numbers that differ only in these units
 };
+
+// Private numbers, so that equal units are still compared rather than found to be one object.
+int32_t UnitsOrder(const Powers& a, const Powers& b) {
+  return TDWFloat64(Make(a), nullptr).CompareForSorting(TDWFloat64(Make(b), nullptr));
+}
 
 const OrderCase kOrderCases[] = {
     {"Equal", {{kUnitMeters, 1}, {kUnitSeconds, -1}}, {{kUnitSeconds, -1}, {kUnitMeters, 1}}, 0},
@@ -283,9 +310,7 @@ const OrderCase kOrderCases[] = {
 TEST_F(TDUnitsTest, SortingOrder) {
   for (const OrderCase& c : kOrderCases) {
     SCOPED_TRACE(c.name);
-    const TDWUnits a = Make(c.a);
-    const TDWUnits b = Make(c.b);
-    EXPECT_EQ(a.GetUnitsImpPtr()->CompareForSorting(*b.GetUnitsImpPtr()), c.order);
+    EXPECT_EQ(UnitsOrder(c.a, c.b), c.order);
   }
 }
 
@@ -304,10 +329,8 @@ TEST_F(TDUnitsTest, SortingOrderIsAntisymmetricAndAgreesWithEquality) {
   for (size_t i = 0; i < all.size(); ++i) {
     for (size_t j = 0; j < all.size(); ++j) {
       SCOPED_TRACE(testing::Message() << i << " vs " << j);
-      const TDWUnits a = Make(all[i]);
-      const TDWUnits b = Make(all[j]);
-      const int32_t ab = a.GetUnitsImpPtr()->CompareForSorting(*b.GetUnitsImpPtr());
-      const int32_t ba = b.GetUnitsImpPtr()->CompareForSorting(*a.GetUnitsImpPtr());
+      const int32_t ab = UnitsOrder(all[i], all[j]);
+      const int32_t ba = UnitsOrder(all[j], all[i]);
       EXPECT_EQ(Sign(ab), -Sign(ba));
       EXPECT_EQ(ab == 0, i == j);
     }
@@ -336,20 +359,19 @@ const FlatCase kFlatCases[] = {
 TEST_F(TDUnitsTest, FlattenedBytes) {
   for (const FlatCase& c : kFlatCases) {
     SCOPED_TRACE(c.name);
-    const TDWUnits units = Make(c.powers);
-    int32_t status = -1;
-    EXPECT_EQ(Flatten(*units.GetUnitsImpPtr(), &status), c.bytes);
-    EXPECT_EQ(status, 0);
-    EXPECT_EQ(FlatSize(*units.GetUnitsImpPtr()), static_cast<int32_t>(c.bytes.size()));
+    const TDRFloat64 number(Make(c.powers), nullptr);
+    ASSERT_TRUE(number);
+    // The record's size field counts the units part as its flattened size.
+    const Bytes record = RecordWith(c.bytes);
+    EXPECT_EQ(Saved(number), record);
 
-    TDWUnits back = Make({{kUnitAmperes, 4}});  // reading replaces what was there
-    size_t consumed = 0;
-    Bytes followed = c.bytes;
+    Bytes followed = record;
     followed.push_back(0xAB);
-    EXPECT_EQ(UnFlatten(followed, back.GetUnitsImpPtr().get(), &consumed), 0);
-    EXPECT_EQ(consumed, c.bytes.size());
-    EXPECT_EQ(PowersOf(back), PowersOf(units));
-    EXPECT_EQ(back.CheckIn(), units.CheckIn());
+    const Loaded loaded = Load(followed);
+    EXPECT_EQ(loaded.status, 0);
+    EXPECT_EQ(loaded.consumed, record.size());
+    EXPECT_EQ(loaded.type, number);
+    EXPECT_EQ(PowersOf(UnitsOf(loaded.type)), PowersOf(Make(c.powers)));
   }
 }
 
@@ -357,40 +379,43 @@ TEST_F(TDUnitsTest, ReadingNormalisesEntries) {
   // Polymorphic key -12, a zero exponent, a key given twice (the later one wins).
   const Bytes bytes = {0x00, 0x04, 0xFF, 0xF4, 0x00, 0x01, 0x00, 0x05, 0x00, 0x00,
                        0x00, 0x03, 0x00, 0x01, 0x00, 0x03, 0x00, 0x02};
-  TDWUnits units;
-  EXPECT_EQ(UnFlatten(bytes, units.GetUnitsImpPtr().get()), 0);
-  EXPECT_EQ(PowersOf(units), (Powers{{-2, 1}, {kUnitMeters, 2}}));
+  const Loaded loaded = Load(RecordWith(bytes));
+  ASSERT_EQ(loaded.status, 0);
+  EXPECT_EQ(PowersOf(UnitsOf(loaded.type)), (Powers{{-2, 1}, {kUnitMeters, 2}}));
+  // Saved again, the entries are in their canonical form.
+  EXPECT_EQ(Saved(loaded.type), RecordWith({0x00, 0x02, 0xFF, 0xFE, 0x00, 0x01, 0x00, 0x03, 0x00, 0x02}));
 }
 
-TEST_F(TDUnitsTest, ReadingAKeyAboveNineFailsAndChangesNothing) {
-  const Bytes bytes = {0x00, 0x02, 0x00, 0x03, 0x00, 0x01, 0x00, 0x0A, 0x00, 0x01, 0x12, 0x34};
-  TDWUnits units = Make({{kUnitKelvins, 1}});
+TEST_F(TDUnitsTest, ReadingAKeyAboveNineFails) {
+  const Bytes bytes = RecordWith({0x00, 0x02, 0x00, 0x03, 0x00, 0x01, 0x00, 0x0A, 0x00, 0x01, 0x12, 0x34});
   const PersistTDData persist(kVersion);
   InputBuf in(bytes.data(), bytes.size());
-  TDDataReader reader(&persist, &in, &kBigEndian, 0);
-  EXPECT_EQ(units.GetUnitsImpPtr()->UnFlatten(&reader), kStatusBadArgument);
+  KoDataReader reader(&persist, &in, &kBigEndian, 0);
+  EXPECT_FALSE(reader.ReadTD());
   EXPECT_EQ(reader.GetError(), kStatusBadArgument);
   uint16_t next = 7;
   EXPECT_EQ(reader.ReadU16(&next), kStatusBadArgument);  // the reader keeps the error
-  EXPECT_EQ(PowersOf(units), (Powers{{kUnitKelvins, 1}}));
+  TMTypeList list;
+  EXPECT_EQ(UnFlattenListOfTypes(&persist, bytes.data(), static_cast<uint32_t>(bytes.size()), &list, nullptr, 0,
+                                 &kBigEndian),
+            kStatusOutOfMemory);
 }
 
 TEST_F(TDUnitsTest, TruncatedInputGivesAStatus) {
-  const Bytes whole = kFlatCases[3].bytes;
-  for (size_t length = 0; length < whole.size(); ++length) {
+  const Bytes whole = RecordWith(kFlatCases[3].bytes);
+  for (size_t length = 0; length < kFlatCases[3].bytes.size(); ++length) {
     SCOPED_TRACE(length);
     LiveBlockCheck blocks;
-    TDWUnits units = Make({{kUnitMoles, -1}});
-    const int32_t hashBefore = units.GetHashValue();
-    EXPECT_EQ(UnFlatten(Bytes(whole.begin(), whole.begin() + length), units.GetUnitsImpPtr().get()),
-              kStatusCorruptData);
-    EXPECT_EQ(PowersOf(units), (Powers{{kUnitMoles, -1}}));
-    EXPECT_EQ(units.GetHashValue(), hashBefore);
+    const Loaded loaded = Load(Bytes(whole.begin(), whole.begin() + kUnitsPartOffset + length));
+    EXPECT_EQ(loaded.status, kStatusCorruptData);
+    EXPECT_FALSE(loaded.type);
   }
   // A huge count with nothing behind it stops at the end of the bytes.
-  TDWUnits units;
-  EXPECT_EQ(UnFlatten({0xFF, 0xFF, 0x00, 0x01}, units.GetUnitsImpPtr().get()), kStatusCorruptData);
-  EXPECT_EQ(units.GetNumUnits(), 0u);
+  LiveBlockCheck blocks;
+  const Bytes huge = RecordWith({0xFF, 0xFF, 0x00, 0x01});
+  const Loaded loaded = Load(Bytes(huge.begin(), huge.begin() + kUnitsPartOffset + 4));
+  EXPECT_EQ(loaded.status, kStatusCorruptData);
+  EXPECT_FALSE(loaded.type);
 }
 
 // ---- dump ----
@@ -407,10 +432,14 @@ TEST_F(TDUnitsTest, DebugDump) {
       EXPECT_EQ(m.module, "TDUnits");
     }
   }
+  // Inside a number's dump the units lines carry the prefix the number's lines carry.
   DebugCapture capture;
-  Make({{kUnitSteradians, -4}}).GetUnitsImpPtr()->PrintDebugStr(reinterpret_cast<const uint8_t*>("  "));
-  EXPECT_EQ(capture.Texts(),
-            (std::vector<std::string>{"  # of units = 1", "  units = {", "  \tsteradians ^ -4", "  \t}"}));
+  TDRFloat64(Make({{kUnitSteradians, -4}}), nullptr).PrintDebugStr(U("  "));
+  const std::vector<std::string> texts = capture.Texts();
+  const std::vector<std::string> unitsLines = {"  \t# of units = 1", "  \tunits = {", "  \t\tsteradians ^ -4",
+                                               "  \t\t}"};
+  EXPECT_NE(std::search(texts.begin(), texts.end(), unitsLines.begin(), unitsLines.end()), texts.end())
+      << testing::PrintToString(texts);
 }
 
 // ---- interning ----
@@ -454,31 +483,34 @@ TEST_F(TDUnitsTest, SetUnitRunningOutOfMemoryChangesNothing) {
 }
 
 TEST_F(TDUnitsTest, UnFlattenRunningOutOfMemory) {
-  const Bytes bytes = kFlatCases[3].bytes;
+  const Bytes bytes = RecordWith(kFlatCases[3].bytes);
+  // Interned first, so that a load that fails leaves no half-interned member behind.
+  const TDRFloat64 expected(Make(kFlatCases[3].powers), nullptr);
+  int32_t storageRefusals = 0;
   for (int64_t nth = 1;; ++nth) {
     SCOPED_TRACE(nth);
     ASSERT_LT(nth, 100) << "never succeeded";
     LiveBlockCheck blocks;
-    TDWUnits units = Make({{kUnitMoles, 1}});
-    const PersistTDData persist(kVersion);
-    InputBuf in(bytes.data(), bytes.size());
-    TDDataReader reader(&persist, &in, &kBigEndian, 0);
-    int32_t status = 0;
+    Loaded loaded;
     bool fired = false;
     {
       ScopedAllocationFailure failure(nth);
-      status = units.GetUnitsImpPtr()->UnFlatten(&reader);
+      loaded = Load(bytes);
       fired = failure.Fired();
     }
-    EXPECT_EQ(reader.GetError(), status);
-    if (!fired) {
-      EXPECT_EQ(status, 0);
-      EXPECT_EQ(PowersOf(units), (Powers{{-2, -3}, {kUnitCandelas, 300}}));
-      break;
+    if (!fired || loaded.type) {  // some room is only reserved ahead, and the load does without
+      EXPECT_EQ(loaded.status, 0);
+      EXPECT_EQ(loaded.type, expected);
+      if (!fired) break;
+      continue;
     }
-    EXPECT_EQ(status, kStatusOutOfMemory);
-    EXPECT_EQ(PowersOf(units), (Powers{{kUnitMoles, 1}}));
+    EXPECT_FALSE(loaded.type);
+    // A units object made without its storage refuses to be read into (42); any other failure,
+    // the entries' among them, is out of memory.
+    if (loaded.status == kStatusNullHandle) ++storageRefusals;
+    else EXPECT_EQ(loaded.status, kStatusOutOfMemory);
   }
+  EXPECT_LE(storageRefusals, 1);
 }
 
 TEST_F(TDUnitsTest, CheckInAndCloneRunningOutOfMemory) {
