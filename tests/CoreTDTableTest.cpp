@@ -187,7 +187,9 @@ const std::vector<std::string> kDictionaryNames = {"TD",   "Name",         "Type
 TEST_F(CoreTDTableTest, RegistryFollowsTheService) {
   EXPECT_EQ(GetNumDictionaries(), 8);
   EXPECT_EQ(RegisteredNames(), kDictionaryNames);
-  EXPECT_EQ(GetTDDictionaries()[0], GetTDDictionaries()[0]);
+  const uint32_t descriptors = GetTDDictionaries()[0]->Size();
+  const TDR fresh = TDRBoolean(U("registry"));
+  EXPECT_EQ(GetTDDictionaries()[0]->Size(), descriptors + 1) << "the first entry holds the descriptors";
   EXPECT_TRUE(HasRecursiveTypesTable());
 
   DebugCapture capture;
@@ -392,68 +394,76 @@ TEST_F(CoreTDTableTest, RecursiveTypesNothingReachesAreDropped) {
   EXPECT_EQ(InsertRecursiveTypeIntoTable(held), kStatusNullHandle);
 }
 
+ITDDictionary* Registered(std::string_view name) {
+  for (int32_t i = 0; i < GetNumDictionaries(); ++i) {
+    if (GetTDDictionaries()[i]->Name() == name) return GetTDDictionaries()[i];
+  }
+  return nullptr;
+}
+
+// Names check in through the registered name dictionary, which keeps each text once.
 TEST_F(CoreTDTableTest, DictionaryInternsFindsPurgesAndEmpties) {
-  LiveBlockCheck leaks;
-  NameDictionary dictionary("Local");
-  EXPECT_STREQ(dictionary.Name(), "Local");
-  TDNameImpPtr first = TDNameImp::Make(U("ab"), 2);
-  TDNameImpPtr sameText = TDNameImp::Make(U("ab"), 2);
-  TDNameImpPtr colliding = TDNameImp::Make(U("b`"), 2);
-  ASSERT_EQ(first->GetHashValue(), colliding->GetHashValue()) << "two texts with one hash";
+  ITDDictionary* names = Registered("Name");
+  ASSERT_NE(names, nullptr);
+  const uint32_t before = names->Size();
+  const TDWName first(U("ab"));
+  const TDWName colliding(U("b`"));
+  ASSERT_EQ(first.GetHashValue(), colliding.GetHashValue()) << "two texts with one hash";
 
-  EXPECT_FALSE(dictionary.Find(*first));
-  const TDNameImpPtr original = first;
-  EXPECT_EQ(dictionary.Insert(first), kStatusNoError);
-  EXPECT_TRUE(first == original);
-  EXPECT_EQ(dictionary.Insert(sameText), kStatusNoError);
-  EXPECT_TRUE(sameText == original) << "an equal object is replaced by the interned one";
-  EXPECT_EQ(dictionary.Insert(colliding), kStatusNoError);
-  EXPECT_FALSE(colliding == original);
-  EXPECT_EQ(dictionary.Size(), 2u);
-  EXPECT_TRUE(dictionary.Find(*TDNameImp::Make(U("b`"), 2)) == colliding);
-  EXPECT_TRUE(dictionary.Find(*TDNameImp::Make(U("ab"), 2)) == original);
-  EXPECT_FALSE(dictionary.Find(*TDNameImp::Make(U("ba"), 2)));
+  const TDRName original = first.CheckIn();
+  ASSERT_TRUE(original);
+  EXPECT_EQ(names->Size(), before + 1);
+  EXPECT_TRUE(TDWName(U("ab")).CheckIn() == original) << "an equal object gives the interned one";
+  TDRName other = colliding.CheckIn();
+  ASSERT_TRUE(other);
+  EXPECT_FALSE(other == original);
+  EXPECT_EQ(names->Size(), before + 2);
+  EXPECT_TRUE(TDWName(U("b`")).CheckIn() == other);
+  EXPECT_TRUE(TDWName(U("ab")).CheckIn() == original);
+  EXPECT_EQ(names->Size(), before + 2);
 
-  dictionary.Purge();
-  EXPECT_EQ(dictionary.Size(), 2u) << "held objects stay";
-  colliding.Free();
-  dictionary.Purge();
-  EXPECT_EQ(dictionary.Size(), 1u);
-  EXPECT_FALSE(dictionary.Find(*TDNameImp::Make(U("b`"), 2)));
+  names->Purge();
+  EXPECT_EQ(names->Size(), before + 2) << "held objects stay";
+  other = TDRName();
+  names->Purge();
+  EXPECT_EQ(names->Size(), before + 1);
+  EXPECT_TRUE(TDWName(U("ab")).CheckIn() == original);
 
-  dictionary.Empty();
-  EXPECT_EQ(dictionary.Size(), 0u);
-  EXPECT_FALSE(dictionary.Find(*original));
+  names->Empty();
+  EXPECT_EQ(names->Size(), 0u);
+  const TDRName again = TDWName(U("ab")).CheckIn();
+  EXPECT_FALSE(again == original) << "an emptied dictionary no longer finds what it held";
+  EXPECT_EQ(names->Size(), 1u);
 }
 
 TEST_F(CoreTDTableTest, DictionaryInsertUnderAllocationFailure) {
+  ITDDictionary* names = Registered("Name");
+  ASSERT_NE(names, nullptr);
+  // Emptying gives the bucket array back too, so the count below covers the whole table.
+  names->Empty();
   LiveBlockCheck leaks;
-  NameDictionary dictionary("Local");
   bool succeeded = false;
   for (int64_t n = 1; n <= 50 && !succeeded; ++n) {
     SCOPED_TRACE(n);
-    TDNameImpPtr name = TDNameImp::Make(U("swept"), 5);
-    const TDNameImpPtr mine = name;
-    int32_t status = 0;
+    const TDWName name(U("swept"));
+    TDRName interned;
     bool fired = false;
     {
       ScopedAllocationFailure failure(n);
-      status = dictionary.Insert(name);
+      interned = name.CheckIn();
       fired = failure.Fired();
     }
-    EXPECT_TRUE(name == mine);
     if (fired) {
-      EXPECT_EQ(status, kStatusOutOfMemory);
-      EXPECT_EQ(dictionary.Size(), 0u);
-      EXPECT_FALSE(dictionary.Find(*mine));
+      EXPECT_FALSE(interned);
+      EXPECT_EQ(names->Size(), 0u);
     } else {
-      EXPECT_EQ(status, kStatusNoError);
-      EXPECT_EQ(dictionary.Size(), 1u);
+      EXPECT_TRUE(interned);
+      EXPECT_EQ(names->Size(), 1u);
       succeeded = true;
     }
   }
   EXPECT_TRUE(succeeded);
-  dictionary.Empty();
+  names->Empty();
 }
 
 std::string ConcurrentName(int32_t i) { return "concurrent " + std::to_string(i); }

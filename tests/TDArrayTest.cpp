@@ -6,8 +6,10 @@
 
 #include <gtest/gtest.h>
 
+#include <cstdint>
 #include <cstring>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "support/TestSupport.h"
@@ -142,16 +144,6 @@ TEST(TDArrayCounting, CompactSubArray) {
   EXPECT_FALSE(CompactSubArray(gapped, 2, 4));
   EXPECT_FALSE(CompactSubArray(strided, 2, 4));
   EXPECT_FALSE(CompactSubArray(compact, 2, 8));
-}
-
-TEST(TDArrayCounting, AllocationAlignmentTable) {
-  const std::pair<int64_t, int32_t> table[] = {{0, 8},         {1023, 8},      {1024, 22},      {2000, 22},
-                                               {0x3FFF, 22},   {0x4000, 64},   {20000, 64},     {0x10000, 256},
-                                               {0x40000, 1024}, {0xFFFFF, 1024}, {0x100000, 4096}};
-  for (const auto& [total, alignment] : table) {
-    SCOPED_TRACE(total);
-    EXPECT_EQ(ArrayAllocationAlignment(total), alignment);
-  }
 }
 
 // --- descriptors ---------------------------------------------------------------------------------
@@ -421,6 +413,23 @@ TEST_F(TDArrayTest, ResizingKeepsAndZeroes) {
   reinterpret_cast<int32_t*>(*empty.H())[0] = 0;
 }
 
+// A new block starts at the boundary its total size calls for. Below 0x4000 bytes the table asks
+// no more than every block gets anyway.
+TEST_F(TDArrayTest, NewBlocksAlignByTheirTotalSize) {
+  const std::pair<int32_t, uintptr_t> table[] = {{0x4000, 64},    {20000, 64},     {0x10000, 256},
+                                                 {0x40000, 1024}, {0xFFFFF, 1024}, {0x100000, 4096}};
+  for (const auto& [total, alignment] : table) {
+    SCOPED_TRACE(total);
+    UHandle h = nullptr;
+    // A one-dimensional UInt8 array: its dimension word, then one byte per element.
+    ASSERT_EQ(SetArraySizeFromTDR(GetuB(), 1, &h, total - 4, 0), kStatusNoError);
+    ASSERT_NE(h, nullptr);
+    EXPECT_EQ(DSGetHandleSize(h), static_cast<size_t>(total));
+    EXPECT_EQ(reinterpret_cast<uintptr_t>(*h) % alignment, 0u);
+    DSDisposeHandle(h);
+  }
+}
+
 TEST_F(TDArrayTest, ShrinkingStringsGivesTheirHandlesBack) {
   const TDRArray type(1, GetStringTD());
   Datum datum(type);
@@ -680,9 +689,10 @@ TEST_F(TDArrayTest, ViewsIntoSubArraysAndBack) {
 
 TEST_F(TDArrayTest, ArrayDataPtrIsNeverCopiedAsAValue) {
   const TDR fixedString = TDRString(nullptr, Fix(3));
-  EXPECT_EQ(MakeArray(fixedString, {Fix(2), Fix(3)}).GetImp()->IsFlatDataFixedSize(), 1);
-  EXPECT_EQ(MakeArray(fixedString, {Fix(2), 3}).GetImp()->IsFlatDataFixedSize(), 0);
-  EXPECT_EQ(MakeArray(GetStringTD(), {Fix(2)}).GetImp()->IsFlatDataFixedSize(), 0);
+  // Without data only an array of fixed size all through knows its elements' flattened size.
+  EXPECT_EQ(MakeArray(fixedString, {Fix(2), Fix(3)}).FlatDataSize(nullptr, nullptr), 8u + 6 * (4 + 3));
+  EXPECT_EQ(MakeArray(fixedString, {Fix(2), 3}).FlatDataSize(nullptr, nullptr), 8u);
+  EXPECT_EQ(MakeArray(GetStringTD(), {Fix(2)}).FlatDataSize(nullptr, nullptr), 4u);
   const TDRArrayDataPtr pointer(1, GetiL());
   EXPECT_EQ(pointer.DataSize(), 8);
   EXPECT_EQ(pointer.DataShape(), kDataShapePlain);

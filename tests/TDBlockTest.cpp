@@ -169,7 +169,7 @@ TEST_F(TDBlockTest, IdentityAndOrder) {
   for (const Case& c : kCases) {
     SCOPED_TRACE(c.name);
     EXPECT_FALSE(c.a == c.b);
-    const int32_t order = c.a.GetImp()->CompareForSorting(c.b.GetImp());
+    const int32_t order = c.a.CompareForSorting(c.b);
     EXPECT_EQ((order > 0) - (order < 0), c.sign);
   }
   EXPECT_TRUE(Repeated(GetiB(), 2) == Repeated(GetiB(), 2));

@@ -373,7 +373,6 @@ TEST_F(TDClusterTest, ComputedPredicates) {
   EXPECT_EQ(Cluster({GetiL(), generic.CheckIn()}).IsSemiGeneric(), 1);
   EXPECT_EQ(Cluster({GetiL(), Cluster({generic.CheckIn()})}).IsSemiGeneric(), 1);
   EXPECT_EQ(Cluster({GetiL()}).IsSemiGeneric(), 0);
-  EXPECT_EQ(Cluster({GetiL(), GetStringTD()}).GetImp()->DefinedType(0), 1);
 }
 
 TEST_F(TDClusterTest, ErrorCluster) {

@@ -85,19 +85,16 @@ TEST_F(TDContainerTest, WhatMakesTwoContainersDifferent) {
 }
 
 TEST_F(TDContainerTest, AnAbsentElementEqualsOnlyAnAbsentElement) {
-  TDWCluster a;
-  a << GetiL() << GetiW();
-  TDWCluster b = a.Clone();
-  TDContainerImp* first = AsWritableContainer(a);
-  TDContainerImp* second = AsWritableContainer(b);
-  ASSERT_NE(first, nullptr);
-  first->SetEltImpPtr(1, TDImpPtr());
+  TDWPtrTo a;
+  ASSERT_EQ(a.SetEltTD(GetiL()), kStatusNoError);
+  TDWPtrTo b = a.Clone();
+  ASSERT_EQ(a.RemoveEltTD(), kStatusNoError);
   EXPECT_EQ(a.IsSameAs(b), 0);
-  second->SetEltImpPtr(1, TDImpPtr());
+  EXPECT_EQ(b.IsSameAs(a), 0);
+  ASSERT_EQ(b.RemoveEltTD(), kStatusNoError);
   EXPECT_EQ(a.IsSameAs(b), 1);
   EXPECT_TRUE(a.CheckIn() == b.CheckIn());
-  EXPECT_FALSE(a.GetEltTD(1));
-  EXPECT_EQ(a.GetNumElts(), 2);
+  EXPECT_FALSE(a.CheckIn().GetEltTD());
 }
 
 TEST_F(TDContainerTest, CheckOutGivesAnIndependentWritableTree) {
@@ -270,9 +267,18 @@ TEST_F(TDContainerTest, HandleWalkReplacesWritableElements) {
   EXPECT_EQ(single.GetTypeCode(), 0x0A);
 }
 
-// Any Int16 becomes a fresh Float64, seen at the level of the objects.
-TDTraverseValue WidenAnyInt16(TDImp* type, void*, TDImpPtr* replacement) {
-  if (type->GetTypeCode() == 0x02) *replacement = TDWFloat64().GetImpPtr();
+// Interned objects reach the visitor as null handles, so it picks its victim by visiting order.
+struct NthVisit {
+  int32_t visits = 0;
+  int32_t replaceAt = -1;
+};
+
+TDTraverseValue WidenNthVisit(TDW& type, void* context, bool* replaced) {
+  auto* walk = static_cast<NthVisit*>(context);
+  if (walk->visits++ == walk->replaceAt) {
+    type = TDWFloat64();
+    *replaced = true;
+  }
   return kTraverseContinue;
 }
 
@@ -280,19 +286,15 @@ TEST_F(TDContainerTest, ReplacementInsideAnInternedContainerGoesIntoACopy) {
   const TDRCluster shared = Cluster({GetiW(), GetiB()});
   TDWCluster outer;
   outer << GetiL() << shared;
-  TDImpPtr replacement;
-  EXPECT_EQ(outer.GetImp()->TraverseTD(&WidenAnyInt16, nullptr, nullptr, &replacement), 0);
-  EXPECT_FALSE(replacement);  // the writable top took its new element itself
+  const TDImpPtr top = outer.GetImpPtr();
+  NthVisit walk;
+  walk.replaceAt = 3;  // outer, Int32, shared, then shared's Int16
+  EXPECT_EQ(outer.TraverseTDW(&WidenNthVisit, &walk, nullptr), 0);
+  EXPECT_EQ(walk.visits, 5);
+  EXPECT_TRUE(outer.GetImpPtr() == top) << "the writable top takes its new element itself";
   EXPECT_TRUE(shared.GetEltTD(0) == GetiW());
+  EXPECT_TRUE(outer.GetEltTD(1)) << "the interned element handed up a writable copy";
   EXPECT_TRUE(outer.CheckIn() == Cluster({GetiL(), Cluster({GetfD(), GetiB()})}));
-
-  // An interned container at the top hands its changed copy up.
-  TDImpPtr top;
-  EXPECT_EQ(shared.GetImp()->TraverseTD(&WidenAnyInt16, nullptr, nullptr, &top), 0);
-  ASSERT_TRUE(top);
-  EXPECT_EQ(top->IsReadOnlyTD(), 0);
-  EXPECT_TRUE(TDW(top, 1).CheckIn() == Cluster({GetfD(), GetiB()}));
-  EXPECT_TRUE(shared.GetEltTD(0) == GetiW());
 }
 
 // --- marking, mutation, order, lossless conversion ------------------------------------------------------
@@ -352,8 +354,8 @@ TEST_F(TDContainerTest, SortingOrder) {
   };
   for (const Case& c : kCases) {
     SCOPED_TRACE(c.name);
-    const int32_t ab = c.a.GetImp()->CompareForSorting(c.b.GetImp());
-    const int32_t ba = c.b.GetImp()->CompareForSorting(c.a.GetImp());
+    const int32_t ab = c.a.CompareForSorting(c.b);
+    const int32_t ba = c.b.CompareForSorting(c.a);
     EXPECT_EQ((ab > 0) - (ab < 0), c.sign);
     EXPECT_EQ((ba > 0) - (ba < 0), -c.sign);
   }

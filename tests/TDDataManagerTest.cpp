@@ -14,6 +14,7 @@
 #include "support/TypeSystemFixture.h"
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXNumbers.h"
+#include "runtime/PXStrings.h"
 #include "vellum/TDFlags.h"
 #include "vellum.h"
 
@@ -287,13 +288,16 @@ std::string Address(const void* p) {
 }
 
 TEST_F(TDDataManagerTest, DamagedDataGoesToTheRaveProcedure) {
-  const uint8_t data[4] = {};
+  // Strings are the first kind with handles that can be damaged.
+  LStrHandle text = nullptr;
+  ASSERT_EQ(StringUtils::ToLStr("abc", &text), kStatusNoError);
+  (*text)->cnt = 4;  // one byte more than the handle holds
   DebugCapture capture;
   // Without a procedure the damage is still reported.
   SetTDRaveProc(nullptr);
-  EXPECT_EQ(ReportDamagedData(*GetiL().GetImp(), data), 1);
+  EXPECT_EQ(GetStringTD().VerifyData(&text, nullptr), 1);
   ASSERT_EQ(capture.Texts().size(), 1u);
-  EXPECT_EQ(capture.Texts()[0], "##VerifyData err 0x00000001 at type=0x0003, data=" + Address(data));
+  EXPECT_EQ(capture.Texts()[0], "##VerifyData err 0x00000001 at type=0x0030, data=" + Address(&text));
   EXPECT_EQ(capture.Messages()[0].module, "TDDataManager");
   capture.Clear();
 
@@ -301,24 +305,34 @@ TEST_F(TDDataManagerTest, DamagedDataGoesToTheRaveProcedure) {
   gRaveStatus = 0x1234;
   SetTDRaveProc(&RecordingRave);
   EXPECT_EQ(GetTDRaveProc(), &RecordingRave);
-  EXPECT_EQ(ReportDamagedData(*GetBoolTD().GetImp(), data), 0x1234);
+  EXPECT_EQ(GetPictTD().VerifyData(&text, nullptr), 0x1234);
   EXPECT_EQ(gRave.calls, 1);
   EXPECT_EQ(gRave.first, nullptr);
   EXPECT_EQ(gRave.second, nullptr);
   EXPECT_EQ(gRave.code, 1024);
   EXPECT_EQ(capture.Texts(),
-            std::vector<std::string>{"##VerifyData err 0x00001234 at type=0x0021, data=" + Address(data)});
+            std::vector<std::string>{"##VerifyData err 0x00001234 at type=0x0033, data=" + Address(&text)});
   capture.Clear();
 
   // A procedure that accepts the data silences the report.
   gRaveStatus = 0;
-  EXPECT_EQ(ReportDamagedData(*GetBoolTD().GetImp(), data), 0);
+  EXPECT_EQ(GetStringTD().VerifyData(&text, nullptr), 0);
   EXPECT_TRUE(capture.Texts().empty());
 
-  WriteVerifyDataMessage(2, *GetfD().GetImp(), data, 16);
-  EXPECT_EQ(capture.Texts(), std::vector<std::string>{"##VerifyData err 0x00000002 at type=0x000a, data=" +
-                                                      Address(data) + ", eltOffset=16"});
+  // Inside a cluster the element reports first, then the cluster with the element's offset.
+  gRaveStatus = 2;
+  TDWCluster holder;
+  holder << GetfD() << GetfD() << GetStringTD();
+  alignas(8) uint8_t data[24] = {};
+  std::memcpy(data + 16, &text, sizeof text);
+  EXPECT_EQ(holder.CheckIn().VerifyData(data, nullptr), 2);
+  EXPECT_EQ(capture.Texts(),
+            (std::vector<std::string>{"##VerifyData err 0x00000002 at type=0x0030, data=" + Address(data + 16),
+                                      "##VerifyData err 0x00000002 at type=0x0050, data=" + Address(data) +
+                                          ", eltOffset=16"}));
   SetTDRaveProc(nullptr);
+  (*text)->cnt = 3;
+  DSDisposeHandle(reinterpret_cast<UHandle>(text));
 }
 
 }  // namespace

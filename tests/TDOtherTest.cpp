@@ -56,7 +56,7 @@ TEST_F(TDOtherTest, Kinds) {
     TDTypeFactory* factory = GetTypeFactory(c.code);
     ASSERT_NE(factory, nullptr);
     int32_t status = -1;
-    EXPECT_EQ(factory->CreateTD(nullptr, static_cast<uint16_t>(c.code), &status)->GetTypeCode(), c.code);
+    EXPECT_EQ(TD(factory->CreateTD(nullptr, static_cast<uint16_t>(c.code), &status), 1).GetTypeCode(), c.code);
     EXPECT_EQ(status, kStatusNoError);
     DebugCapture capture;
     EXPECT_FALSE(MakeDefaultTDRForTypeCode(c.code));
@@ -75,7 +75,7 @@ TEST_F(TDOtherTest, CallerOwnedStringsAreNeverCopied) {
   EXPECT_EQ(TDRCStr().CopyData(&text, &copy, nullptr, 0), kStatusBadArgument);
   EXPECT_EQ(TDRPStr().CopyData(&text, &copy, nullptr, 0), kStatusBadArgument);
   EXPECT_EQ(copy, nullptr);
-  EXPECT_EQ(TDRCStr().GetImp()->CopyDataConvertCore(TDRPStr().GetImp(), &text, &copy, 0), kStatusBadArgument);
+  EXPECT_EQ(TDRCStr().CopyDataConvert(TDRPStr(), &text, &copy, 0), kStatusBadArgument);
   EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"CopyData bad type=0x00000034", "CopyData bad type=0x00000035",
                                                        "CopyDataConvert tcDst=0x00000035, tcSrc=0x00000034"}));
   EXPECT_EQ(TDRCStr().CmpTD(TDRCStr(U("named")), 0), 0);
@@ -93,10 +93,10 @@ TEST_F(TDOtherTest, PointersCopyTheirValue) {
   EXPECT_EQ(TDRPtr().CopyData(&src, &dst, nullptr, 0), kStatusNoError);
   EXPECT_EQ(dst, &target);
   dst = nullptr;
-  EXPECT_EQ(TDRPtr().GetImp()->CopyDataConvertCore(TDRPtr(U("other")).GetImp(), &src, &dst, 0), kStatusNoError);
+  EXPECT_EQ(TDRPtr().CopyDataConvert(TDRPtr(U("other")), &src, &dst, 0), kStatusNoError);
   EXPECT_EQ(dst, &target);
   DebugCapture capture;
-  EXPECT_EQ(TDRPtr().GetImp()->CopyDataConvertCore(GetiQ().GetImp(), &src, &dst, 0), kStatusBadArgument);
+  EXPECT_EQ(TDRPtr().CopyDataConvert(GetiQ(), &src, &dst, 0), kStatusBadArgument);
   EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"CopyDataConvert tcDst=0x00000004, tcSrc=0x00000080"}));
 
   TDWPtrTo pointer;

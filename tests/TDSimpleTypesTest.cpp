@@ -152,7 +152,7 @@ TEST_F(TDSimpleTypesTest, MutateBooleanRefusesAReadOnlyDescriptor) {
   ASSERT_EQ(capture.Messages().size(), 1u);
   EXPECT_EQ(capture.Messages()[0].text, "What are you doing?  This TDImpPtr is readonly!");
   EXPECT_EQ(capture.Messages()[0].level, 3);
-  EXPECT_EQ(interned->GetTypeCode(), 0x21);
+  EXPECT_EQ(TD(interned, 1).GetTypeCode(), 0x21);
 }
 
 class RecordingVisitor : public ITDVisitor {

@@ -99,17 +99,25 @@ TEST_F(TDStringBaseTest, BoundIsIdentityAndOrder) {
   EXPECT_TRUE(fixed == TDWString(nullptr, vellum::bound::Fixed(3)).CheckIn());
   EXPECT_NE(variable.GetHashValue(), bounded.GetHashValue());
   // Fixed sizes sort first, then variable, then bounds.
-  EXPECT_LT(fixed.GetImp()->CompareForSorting(variable.GetImp()), 0);
-  EXPECT_LT(variable.GetImp()->CompareForSorting(bounded.GetImp()), 0);
-  EXPECT_EQ(bounded.GetImp()->CompareForSorting(TDRPict(nullptr, 5).GetImp()), 0);
+  EXPECT_LT(fixed.CompareForSorting(variable), 0);
+  EXPECT_LT(variable.CompareForSorting(bounded), 0);
+  EXPECT_EQ(bounded.CompareForSorting(TDRString(U("named"), 5)), 0) << "names take no part in the order";
 
   TDWString edit(bounded.CheckOut().GetImpPtr(), 1);
   EXPECT_EQ(edit.GetBound(), 5);
   EXPECT_EQ(edit.SetBound(-1), kStatusNoError);
   EXPECT_TRUE(edit.CheckIn() == variable);
   EXPECT_EQ(TDWStringBase().SetBound(1), kStatusNullHandle);
-  EXPECT_EQ(fixed.GetImp()->IsFlatDataFixedSize(), 1);
-  EXPECT_EQ(bounded.GetImp()->IsFlatDataFixedSize(), 0);
+  // Only a fixed string's flattened size is known without data, so only a fixed array of fixed
+  // strings counts its elements then.
+  auto flatSizeOfTwo = [](const TDR& element) {
+    TDWArray array(0, element);
+    EXPECT_EQ(array.AddDim(vellum::bound::Fixed(2)), kStatusNoError);
+    return array.CheckIn().FlatDataSize(nullptr, nullptr);
+  };
+  EXPECT_EQ(flatSizeOfTwo(fixed), 4u + 2 * (4 + 3));
+  EXPECT_EQ(flatSizeOfTwo(bounded), 4u);
+  EXPECT_EQ(flatSizeOfTwo(variable), 4u);
 }
 
 TEST_F(TDStringBaseTest, ConvertBetweenStringAndSubStringKeepsNameAndBound) {
@@ -167,10 +175,9 @@ TEST_F(TDStringBaseTest, DataAtAnOddOffset) {
   Str source("xyz");
   ASSERT_EQ(fixed.CopyData(&source.h, handleAt, nullptr, 0), kStatusNoError);
   EXPECT_EQ(fixed.VerifyData(handleAt, nullptr), kStatusNoError);
-  ASSERT_EQ(GetStringTD().GetImp()->CopyDataConvertCore(GetSubStringTD().GetImp(), &source.h, recordAt, 0),
-            kStatusNoError);
+  ASSERT_EQ(GetStringTD().CopyDataConvert(GetSubStringTD(), &source.h, recordAt, 0), kStatusNoError);
   EXPECT_EQ(GetSubStringTD().VerifyData(recordAt, nullptr), kStatusNoError);
-  ASSERT_EQ(GetSubStringTD().GetImp()->CopyDataConvertCore(fixed.GetImp(), recordAt, handleAt, 0), kStatusNoError);
+  ASSERT_EQ(GetSubStringTD().CopyDataConvert(fixed, recordAt, handleAt, 0), kStatusNoError);
   ASSERT_EQ(fixed.ResetToDefaultData(handleAt), kStatusNoError);
   EXPECT_EQ(fixed.DeflateData(handleAt, buffer + sizeof buffer, 1, NormalHandleAllocator()), 6);
   EXPECT_EQ(fixed.VerifyData(handleAt, nullptr), kStatusNoError) << "disposed: null again";
@@ -320,13 +327,13 @@ TEST_F(TDStringBaseTest, ConversionsThroughTheSourceCore) {
   DebugCapture capture;
   Str source("abcdef");
   auto convert = [&](const TDR& from, const TDR& to, void* dst) {
-    return from.GetImp()->CopyDataConvertCore(to.GetImp(), &source.h, dst, 0);
+    return from.CopyDataConvert(to, &source.h, dst, 0);
   };
   Str tag;
   EXPECT_EQ(convert(GetStringTD(), GetTagTD(), &tag.h), kStatusNoError);
   EXPECT_EQ(tag.Text(), "abcdef");
   Str back;
-  EXPECT_EQ(GetTagTD().GetImp()->CopyDataConvertCore(GetStringTD().GetImp(), &tag.h, &back.h, 0), kStatusNoError);
+  EXPECT_EQ(GetTagTD().CopyDataConvert(GetStringTD(), &tag.h, &back.h, 0), kStatusNoError);
   EXPECT_EQ(back.Text(), "abcdef");
   Str bounded;
   EXPECT_EQ(convert(GetStringTD(), TDRString(nullptr, 4), &bounded.h), kStatusNoError);
@@ -335,7 +342,7 @@ TEST_F(TDStringBaseTest, ConversionsThroughTheSourceCore) {
   Path path = nullptr;
   EXPECT_EQ(convert(GetStringTD(), GetPathTD(), &path), kStatusBadArgument);
   EXPECT_EQ(convert(GetPictTD(), GetStringTD(), &back.h), kStatusBadArgument);
-  EXPECT_EQ(GetPathTD().GetImp()->CopyDataConvertCore(GetStringTD().GetImp(), &path, &back.h, 0), kStatusBadArgument);
+  EXPECT_EQ(GetPathTD().CopyDataConvert(GetStringTD(), &path, &back.h, 0), kStatusBadArgument);
   EXPECT_EQ(path, nullptr);
   EXPECT_EQ(back.Text(), "abcdef");
 
@@ -351,19 +358,18 @@ TEST_F(TDStringBaseTest, ConversionsThroughTheSourceCore) {
   EXPECT_EQ(rec.length, 2);
 
   // SubString into String, Tag and SubString; anything else is refused.
-  const TDImp* sub = GetSubStringTD().GetImp();
-  EXPECT_EQ(sub->CopyDataConvertCore(GetStringTD().GetImp(), &rec, &back.h, 0), kStatusNoError);
+  const TDR& sub = GetSubStringTD();
+  EXPECT_EQ(sub.CopyDataConvert(GetStringTD(), &rec, &back.h, 0), kStatusNoError);
   EXPECT_EQ(back.Text(), "ab");
   Str fixed;
-  EXPECT_EQ(sub->CopyDataConvertCore(TDRString(nullptr, vellum::bound::Fixed(3)).GetImp(), &rec, &fixed.h, 0),
-            kStatusNoError);
+  EXPECT_EQ(sub.CopyDataConvert(TDRString(nullptr, vellum::bound::Fixed(3)), &rec, &fixed.h, 0), kStatusNoError);
   EXPECT_EQ(fixed.Block(), Block(3, std::string_view("ab\0", 3)));
-  EXPECT_EQ(sub->CopyDataConvertCore(GetTagTD().GetImp(), &rec, &tag.h, 0), kStatusNoError);
+  EXPECT_EQ(sub.CopyDataConvert(GetTagTD(), &rec, &tag.h, 0), kStatusNoError);
   EXPECT_EQ(tag.Text(), "ab");
   SubStringRec narrowed{};
-  EXPECT_EQ(sub->CopyDataConvertCore(TDRSubString(nullptr, 1).GetImp(), &rec, &narrowed, 0), kStatusNoError);
+  EXPECT_EQ(sub.CopyDataConvert(TDRSubString(nullptr, 1), &rec, &narrowed, 0), kStatusNoError);
   EXPECT_EQ(narrowed.length, 1);
-  EXPECT_EQ(sub->CopyDataConvertCore(GetPathTD().GetImp(), &rec, &path, 0), kStatusBadArgument);
+  EXPECT_EQ(sub.CopyDataConvert(GetPathTD(), &rec, &path, 0), kStatusBadArgument);
   EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"CopyDataConvert tcDst=0x00000032, tcSrc=0x00000030",
                                                        "CopyDataConvert tcDst=0x00000030, tcSrc=0x00000033",
                                                        "CopyDataConvert:  destination is not a path!",
@@ -552,7 +558,7 @@ TEST_F(TDStringBaseTest, AllocationFailuresLeakNothing) {
   });
   sweep("ConvertIntoBoundedTag", [&] {
     Str datum;
-    return string.GetImp()->CopyDataConvertCore(tag.GetImp(), &source.h, &datum.h, 0);
+    return string.CopyDataConvert(tag, &source.h, &datum.h, 0);
   });
   sweep("InflatePath", [&] {
     Path datum = nullptr;

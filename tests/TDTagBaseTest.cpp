@@ -72,10 +72,10 @@ TEST_F(TDTagBaseTest, UserDefinedClassIsIdentity) {
 
   // Order: by tag kind first, then no class before a class, then the classes.
   const TDRUserDefinedTag gadget(U("\x06Gadget"));
-  EXPECT_LT(GetTagTD().GetImp()->CompareForSorting(none.GetImp()), 0);
-  EXPECT_LT(none.GetImp()->CompareForSorting(gadget.GetImp()), 0);
-  EXPECT_LT(gadget.GetImp()->CompareForSorting(widget.GetImp()), 0);
-  EXPECT_EQ(widget.GetImp()->CompareForSorting(widget.GetImp()), 0);
+  EXPECT_LT(GetTagTD().CompareForSorting(none), 0);
+  EXPECT_LT(none.CompareForSorting(gadget), 0);
+  EXPECT_LT(gadget.CompareForSorting(widget), 0);
+  EXPECT_EQ(widget.CompareForSorting(widget.CheckOut()), 0);
 }
 
 TEST_F(TDTagBaseTest, SetTagTypeNeverCrossesTheUserDefinedKind) {
@@ -109,8 +109,8 @@ TEST_F(TDTagBaseTest, ContextIsIdentity) {
   tag.SetContextRecursive(b);
   const TDR inB = tag.CheckIn();
   EXPECT_FALSE(inA == inB);
-  EXPECT_NE(inA.GetImp()->CompareForSorting(inB.GetImp()), 0);
-  EXPECT_EQ(inA.GetImp()->CompareForSorting(inB.GetImp()), -inB.GetImp()->CompareForSorting(inA.GetImp()));
+  EXPECT_NE(inA.CompareForSorting(inB), 0);
+  EXPECT_EQ(inA.CompareForSorting(inB), -inB.CompareForSorting(inA));
 }
 
 int32_t CompareNothing(const TDR&, const KoVariant*, const KoVariant*, const KoContext*, const KoContext*, int32_t*) {
@@ -166,7 +166,7 @@ TEST_F(TDTagBaseTest, DataIsAString) {
   EXPECT_EQ(DSGetHandleSize(reinterpret_cast<UHandle>(tag)), 7u);
   LStrHandle text = nullptr;
   ASSERT_EQ(StringUtils::ToLStr("abcdef", &text), kStatusNoError);
-  ASSERT_EQ(GetStringTD().GetImp()->CopyDataConvertCore(bounded.GetImp(), &text, &tag, 0), kStatusNoError);
+  ASSERT_EQ(GetStringTD().CopyDataConvert(bounded, &text, &tag, 0), kStatusNoError);
   EXPECT_EQ(StringUtils::FromLStr(tag), "abc");
   ASSERT_EQ(GetTagTD().CopyData(&text, &tag, nullptr, 0), kStatusNoError);
   EXPECT_EQ(StringUtils::FromLStr(tag), "abcdef");

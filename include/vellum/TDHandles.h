@@ -13,6 +13,7 @@
 #include "vellum/TypeCodes.h"
 
 struct KoContext;
+class DebugStream;
 class TDRefCountedObj;
 class TDImp;
 class TDAttributeImp;
@@ -320,6 +321,9 @@ const KoContext* GetCopyDataConvertSourceContextForProbe();
 
 // The short type text: "null" for a null handle, otherwise the kind's text.
 std::string ToString(const TDR& type);
+// Appends `[TD "name"]` to the stream: the descriptor's name, empty when it has none or the
+// handle is null.
+void ToDebugStream(DebugStream& stream, const TD& type);
 
 // ---------------------------------------------------------------------------------------------
 // Typed handles. A kind describes itself with a small struct:

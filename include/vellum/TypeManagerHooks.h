@@ -3,6 +3,7 @@
 // are plain stores, meant to be called before concurrent use.
 #pragma once
 
+#include <atomic>
 #include <cstdint>
 #include <string>
 
@@ -64,8 +65,13 @@ using GetSpecialClusterRulesProc = int32_t (*)(const TD&);
 void SetTDSanityCheckProc(TDSanityCheckProc proc);
 void SetTDRaveProc(TDRaveProc proc);
 TDRaveProc GetTDRaveProc();
-// The running process's largest alignment for data layout; 0 (packed) until set.
+namespace vellum::detail {
+extern std::atomic<int32_t> gDSAlign;
+}  // namespace vellum::detail
+// The running process's largest alignment for data layout; 0 (packed) until set. The getter is
+// inline: every layout question and every cluster copy asks it.
 void SetDSAlign(int32_t alignment);
+inline int32_t GetDSAlign() { return vellum::detail::gDSAlign.load(std::memory_order_relaxed); }
 void SetCompleteDataSizeProc(CompleteDataSizeProc proc);
 void SetEventToEventTypeEnumProc(EventToEventTypeEnumProc proc);
 void SetFindRefObjTDRProc(FindRefObjTDRProc proc);
@@ -81,3 +87,32 @@ void TDEnableRecursiveTypes(bool enable);
 void SetDestroyTDListener(DestroyTDListener listener);
 void SetGetSpecialClusterRulesProc(GetSpecialClusterRulesProc proc);
 void SetGarbageCollectingTDs(bool enable);
+
+// What the library consults of the host's hooks.
+TDSanityCheckProc GetTDSanityCheckProc();
+CompleteDataSizeProc GetCompleteDataSizeProc();
+EventToEventTypeEnumProc GetEventToEventTypeEnumProc();
+FindRefObjTDRProc GetFindRefObjTDRProc();
+GDataDispatchTableFactoryProc GetGDataDispatchTableFactoryProc();
+StatusMapProc GetHResultToMgErrProc();
+StatusMapProc GetMgErrToHResultProc();
+OleVariantUnFlattenDataProc GetOleVariantUnFlattenDataProc();
+TypeToShortStringProc GetTypeToShortStringProc();
+bool IsCoerceFromKoVariantEnabled();
+bool IsFlatTypeCacheEnabled();
+bool IsPreAllocationEnabled();
+bool AreRecursiveTypesEnabled();
+
+// A slot in static storage for one shared descriptor. The registry links it; the service's stop
+// releases its descriptor and unlinks it, so that it can be registered again after a restart.
+struct GlobalTypeEntry {
+  TDR td;
+  std::atomic<bool> set{false};
+  GlobalTypeEntry* next = nullptr;
+};
+
+// Under "RegisterMutex", from any thread: the first registration of an entry wins; later ones,
+// and a null entry, change nothing.
+void TDRegisterType(GlobalTypeEntry* entry, const TDR& td);
+// The number of entries linked since the service started.
+int32_t GetNumRegisteredTypes();

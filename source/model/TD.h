@@ -11,6 +11,7 @@
 #include "vellum/TDHandles.h"
 #include "vellum/TDLayout.h"
 #include "vellum/TypeCodes.h"
+#include "vellum/TypeManagerHooks.h"
 
 class TDDataWriter;
 class TDDataReader;
@@ -169,17 +170,6 @@ inline TDR TDRFromImp(const TDImpPtr& imp) { return TDR(imp, 1); }
 
 // Zeroes the in-place bytes of one datum of `type` when `clear` is nonzero.
 void TDImpClearMemory(void* data, const TDImp* type, int32_t clear);
-
-// Appends `[TD "name"]` to the stream.
-void ToDebugStream(DebugStream& stream, const TD& type);
-
-namespace vellum::detail {
-extern std::atomic<int32_t> gDSAlign;
-}  // namespace vellum::detail
-
-// The running process's largest alignment (SetDSAlign); 0, packed, until the host sets it.
-// Inline: every layout question and every cluster copy asks it.
-inline int32_t GetDSAlign() { return vellum::detail::gDSAlign.load(std::memory_order_relaxed); }
 
 // Writes the record of `type` (and first those of every descriptor it needs) unless the writer's
 // save table holds an equal one, and gives its save-table index.

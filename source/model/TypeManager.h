@@ -28,32 +28,7 @@ using DefaultTypeGetter = const TDR& (*)();
 void RegisterDefaultTypeGetter(int32_t code, DefaultTypeGetter getter);
 bool HasDefaultTypeGetter(int32_t code);
 
-// A static slot for one shared descriptor, released when the service stops.
-struct GlobalTypeEntry {
-  TDR td;
-  std::atomic<bool> set{false};
-  GlobalTypeEntry* next = nullptr;
-};
-
-// Under "RegisterMutex": the first registration of an entry wins; later ones change nothing.
-void TDRegisterType(GlobalTypeEntry* entry, const TDR& td);
-int32_t GetNumRegisteredTypes();
-
 // The shared descriptor held by `entry`, built on first use by checking in `make()`. Builders
 // on several threads all obtain the same interned object. The null `TDR` when memory runs out.
 const TDR& SharedGlobalType(GlobalTypeEntry& entry, TDImpPtr (*make)());
 
-// What the library consults of the host's hooks.
-TDSanityCheckProc GetTDSanityCheckProc();
-CompleteDataSizeProc GetCompleteDataSizeProc();
-EventToEventTypeEnumProc GetEventToEventTypeEnumProc();
-FindRefObjTDRProc GetFindRefObjTDRProc();
-GDataDispatchTableFactoryProc GetGDataDispatchTableFactoryProc();
-StatusMapProc GetHResultToMgErrProc();
-StatusMapProc GetMgErrToHResultProc();
-OleVariantUnFlattenDataProc GetOleVariantUnFlattenDataProc();
-TypeToShortStringProc GetTypeToShortStringProc();
-bool IsCoerceFromKoVariantEnabled();
-bool IsFlatTypeCacheEnabled();
-bool IsPreAllocationEnabled();
-bool AreRecursiveTypesEnabled();
