@@ -493,7 +493,9 @@ TEST_F(CoreTDTableTest, ConcurrentCheckInsOfTheSameNewTypesGiveOneObjectEach) {
       for (int32_t j = 0; j < kTypes; ++j) {
         const int32_t i = (j + t * 37) % kTypes;
         TDWBoolean type(U(ConcurrentName(i).c_str()));
-        if (i % 2 != 0) type.SetNoSelectMask(1);
+        if (i % 2 != 0) {
+          EXPECT_EQ(type.SetNoSelectMask(1), kStatusNoError);
+        }
         results[t][i] = type.CheckIn();
       }
     });

@@ -167,13 +167,13 @@ TEST_F(KoDataFlattenTest, ArraysAreRefusedWhenTheirElementsCannotBeInTheInput) {
 
 TEST_F(KoDataFlattenTest, BoundedAndFixedArraysStayInTheirBlocks) {
   TDWArray bounded(0, GetiW());
-  bounded.AddDim(2, 0);
+  EXPECT_EQ(bounded.AddDim(2, 0), kStatusNoError);
   const TDR type = bounded.CheckIn();
   Datum value(type, DatumStart::kDefault);
   ASSERT_EQ(Unflatten(type, "00 00 00 03 00 01 00 02 00 03", value.Data()), kStatusNoError);
   EXPECT_EQ(Flatten(type, value.Data()), "00 00 00 02 00 01 00 02");
   TDWArray fixed(0, GetiW());
-  fixed.AddDim(vellum::bound::Fixed(3), 0);
+  EXPECT_EQ(fixed.AddDim(vellum::bound::Fixed(3), 0), kStatusNoError);
   const TDR fixedType = fixed.CheckIn();
   Datum three(fixedType, DatumStart::kDefault);
   DebugCapture capture;

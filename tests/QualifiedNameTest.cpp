@@ -432,7 +432,7 @@ TEST(QualifiedNameTest, UnFlattenLeavesTheRestOfTheStream) {
 
 TEST(QualifiedNameTest, UnFlattenRunningOutOfMemory) {
   QualifiedName expected;
-  for (int i = 0; i < 12; ++i) expected.Insert(std::string(20 + i, static_cast<char>('a' + i)), i);
+  for (int i = 0; i < 12; ++i) ASSERT_EQ(expected.Insert(std::string(20 + i, static_cast<char>('a' + i)), i), kStatusNoError);
   const Bytes bytes = Flatten(expected);
   SweepAllocationFailures(kStatusOutOfMemory, [&] {
     QualifiedName name;

@@ -87,10 +87,10 @@ TEST_F(TD80ReadWriteTest, GoldenRecordsOfTheCommonShapes) {
 
 TEST_F(TD80ReadWriteTest, NamesArePaddedToEvenLength) {
   TDWInt32 three;
-  three.SetName("abc");
+  EXPECT_EQ(three.SetName("abc"), kStatusNoError);
   EXPECT_EQ(Flat(three.CheckIn()), "00 00 00 01 00 09 40 03 00 03 61 62 63 00 01 00 00");
   TDWInt32 four;
-  four.SetName("abcd");
+  EXPECT_EQ(four.SetName("abcd"), kStatusNoError);
   EXPECT_EQ(Flat(four.CheckIn()), "00 00 00 01 00 0B 40 03 00 04 61 62 63 64 00 00 01 00 00");
   EXPECT_EQ(RoundTrip(three.CheckIn()), three.CheckIn());
   EXPECT_EQ(RoundTrip(four.CheckIn()), four.CheckIn());
@@ -141,8 +141,8 @@ TEST_F(TD80ReadWriteTest, KindsNewerThanTheVersionAreNeitherSavedNorLoaded) {
 
 TEST_F(TD80ReadWriteTest, CodeWordFlags) {
   TDWInt32 flagged;
-  flagged.SetNoSelectMask(1);
-  flagged.SetGenericness(1);
+  EXPECT_EQ(flagged.SetNoSelectMask(1), kStatusNoError);
+  EXPECT_EQ(flagged.SetGenericness(1), kStatusNoError);
   flagged.EphemeralizeTD();
   const TDR type = flagged.CheckIn();
   EXPECT_EQ(Flat(type), "00 00 00 01 00 05 86 03 00 00 01 00 00");
@@ -151,7 +151,7 @@ TEST_F(TD80ReadWriteTest, CodeWordFlags) {
   EXPECT_EQ(Flat(type, 0x08604011), "00 00 00 01 00 04 82 03 00 01 00 00");
 
   TDWBoolean discard;
-  discard.SetEventDiscardMask(1);
+  EXPECT_EQ(discard.SetEventDiscardMask(1), kStatusNoError);
   EXPECT_EQ(Flat(discard.CheckIn()), "00 00 00 01 00 04 01 21 00 01 00 00");
   EXPECT_EQ(RoundTrip(discard.CheckIn()), discard.CheckIn());
   // The event-discard bit means nothing on another code.
@@ -180,7 +180,7 @@ TEST_F(TD80ReadWriteTest, LongRecordsAndIndicesTakeFourBytes) {
   TDWCluster wide;
   for (int i = 0; i < 32770; ++i) {
     TDWInt8 element;
-    element.SetName(std::to_string(i));
+    EXPECT_EQ(element.SetName(std::to_string(i)), kStatusNoError);
     wide << element;
   }
   const TDR cluster = wide.CheckIn();
@@ -209,8 +209,8 @@ TEST_F(TD80ReadWriteTest, OneTypeLoadsAsTheSharedDescriptor) {
 
 TEST_F(TD80ReadWriteTest, ExtraValuesFollowTheirIndices) {
   TMTypeList list;
-  list.AppendType(GetiL(), nullptr);
-  list.AppendType(GetfD(), nullptr);
+  EXPECT_EQ(list.AppendType(GetiL(), nullptr), kStatusNoError);
+  EXPECT_EQ(list.AppendType(GetfD(), nullptr), kStatusNoError);
   const uint32_t extra[] = {7, 40000};
   UHandle h = nullptr;
   ASSERT_EQ(FlattenListOfTypes(nullptr, &list, extra, &h, 0, nullptr, 0), kStatusNoError);
@@ -230,9 +230,9 @@ TEST_F(TD80ReadWriteTest, ExtraValuesFollowTheirIndices) {
 
 TEST_F(TD80ReadWriteTest, SkippedEmptyEntriesReuseThePreviousIndex) {
   TMTypeList list;
-  list.AppendType(TDR(), nullptr);
-  list.AppendType(GetfD(), nullptr);
-  list.AppendType(TDR(), nullptr);
+  EXPECT_EQ(list.AppendType(TDR(), nullptr), kStatusNoError);
+  EXPECT_EQ(list.AppendType(GetfD(), nullptr), kStatusNoError);
+  EXPECT_EQ(list.AppendType(TDR(), nullptr), kStatusNoError);
   UHandle h = nullptr;
   ASSERT_EQ(FlattenListOfTypes(nullptr, &list, nullptr, &h, 0, nullptr, 1), kStatusNoError);
   EXPECT_EQ(HexBytes(*h, DSGetHandleSize(h)), "00 00 00 01 00 05 00 0A 00 00 03 00 00 00 00 00 00");
@@ -337,8 +337,8 @@ TEST_F(TD80ReadWriteTest, ConsolidatedListsReferToTheSharedList) {
   const PersistTDData persist(&shared, nullptr, PXApp::Instance().GetVersion(), 0);
   ASSERT_TRUE(persist.PersistingWithConsolidatedTypes());
   TMTypeList list;
-  list.AppendType(GetiL(), nullptr);
-  list.AppendType(GetfD(), nullptr);
+  EXPECT_EQ(list.AppendType(GetiL(), nullptr), kStatusNoError);
+  EXPECT_EQ(list.AppendType(GetfD(), nullptr), kStatusNoError);
   UHandle h = nullptr;
   ASSERT_EQ(FlattenListOfTypes(&persist, &list, nullptr, &h, 0, nullptr, 0), kStatusNoError);
   EXPECT_EQ(HexBytes(*h, DSGetHandleSize(h)), "00 02 00 01");
@@ -346,7 +346,7 @@ TEST_F(TD80ReadWriteTest, ConsolidatedListsReferToTheSharedList) {
   DSDisposeHandle(h);
   // The same run again is found where it stands; a one-type reference has no count.
   TMTypeList second;
-  second.AppendType(GetfD(), nullptr);
+  EXPECT_EQ(second.AppendType(GetfD(), nullptr), kStatusNoError);
   ASSERT_EQ(FlattenListOfTypes(&persist, &second, nullptr, &h, 1, nullptr, 0), kStatusNoError);
   EXPECT_EQ(HexBytes(*h, DSGetHandleSize(h)), "00 02");
   EXPECT_EQ(shared.GetNumTypes(), 2);
@@ -369,7 +369,7 @@ TEST_F(TD80ReadWriteTest, DeferredReferencesPassThroughThePendingQueue) {
   const std::vector<uint8_t> bytes = BytesFromHex("00 05");
   ASSERT_EQ(UnFlattenListOfTypes(&persist, bytes.data(), 2, &read, nullptr, 1, nullptr), kStatusNoError);
   TMTypeList list;
-  list.AppendType(GetiL(), nullptr);
+  EXPECT_EQ(list.AppendType(GetiL(), nullptr), kStatusNoError);
   UHandle h = nullptr;
   ASSERT_EQ(FlattenListOfTypes(&persist, &list, nullptr, &h, 1, nullptr, 0), kStatusNoError);
   EXPECT_EQ(HexBytes(*h, DSGetHandleSize(h)), "00 05");
@@ -422,7 +422,7 @@ TEST_F(TD80ReadWriteTest, TypesInsideDataAndTheOldFormatHooks) {
 TEST_F(TD80ReadWriteTest, AllocationFailuresLeaveNothingBehind) {
   TDWCluster cluster;
   cluster << GetiL() << TDRArray(1, GetStringTD());
-  cluster.SetName("sweep");
+  EXPECT_EQ(cluster.SetName("sweep"), kStatusNoError);
   const TDR type = cluster.CheckIn();
   SweepAllocationFailures(kStatusOutOfMemory, [&] {
     UHandle h = nullptr;
@@ -693,13 +693,13 @@ TEST_F(TD80ReadWriteTest, EveryWalkOverTheDeepestDescriptorFitsASmallStack) {
          switch (i % 3) {
            case 0: {
              TDWRepeatedBlock repeated;
-             repeated.SetEltTD(inner);
-             repeated.SetNumBlocks(1);
+             EXPECT_EQ(repeated.SetEltTD(inner), kStatusNoError);
+             EXPECT_EQ(repeated.SetNumBlocks(1), kStatusNoError);
              return repeated;
            }
            case 1: {
              TDWTypeBlock block;
-             block.SetEltTD(inner);
+             EXPECT_EQ(block.SetEltTD(inner), kStatusNoError);
              return block;
            }
            default: {
@@ -715,12 +715,12 @@ TEST_F(TD80ReadWriteTest, EveryWalkOverTheDeepestDescriptorFitsASmallStack) {
            case 1: return TDWArray(1, inner);
            case 3: {
              TDWAlignmentMarker marker;
-             marker.SetAlignmentSource(inner);
+             EXPECT_EQ(marker.SetAlignmentSource(inner), kStatusNoError);
              return marker;
            }
            default: {
              TDWPtrTo pointer;
-             pointer.SetEltTD(inner);
+             EXPECT_EQ(pointer.SetEltTD(inner), kStatusNoError);
              return pointer;
            }
          }

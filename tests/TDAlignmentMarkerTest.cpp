@@ -45,7 +45,7 @@ TDRAlignmentMarker Marker(const TD& source) {
 
 TDW Named(const TDR& type, const char* name) {
   TDW copy = type.CheckOut();
-  copy.SetName(std::string(name));
+  EXPECT_EQ(copy.SetName(std::string(name)), kStatusNoError);
   return copy;
 }
 

@@ -251,7 +251,7 @@ TEST_F(TDArrayTest, FactoriesWalksAndMarksReachTheElement) {
       &visited, nullptr);
   EXPECT_EQ(visited, 0x40 + 0x03);
   TDW generic = GetiL().CheckOut();
-  generic.SetGenericness(1);
+  EXPECT_EQ(generic.SetGenericness(1), kStatusNoError);
   EXPECT_EQ(TDRArray(1, generic.CheckIn()).IsSemiGeneric(), 1);
   EXPECT_EQ(TDRArray(1, GetiL()).IsArrayFloat64Wfms(), 0);
 }
@@ -511,7 +511,7 @@ TEST_F(TDArrayTest, FlatAndElementwiseCopies) {
   });
   // Element by element through the conversion dispatch: the descriptors differ by a name.
   TDWArray named(1, GetStringTD());
-  named.SetName(std::string("named"));
+  EXPECT_EQ(named.SetName(std::string("named")), kStatusNoError);
   const TDR other = named.CheckIn();
   SweepAllocationFailures(kStatusOutOfMemory, [&] {
     UHandle h = nullptr;

@@ -38,7 +38,7 @@ TDR Block(int32_t size) {
 
 TDR AlignedBlock(int32_t size, uint16_t alignment) {
   TDWAlignedBlock block;
-  block.SetBlockSize(size);
+  EXPECT_EQ(block.SetBlockSize(size), kStatusNoError);
   EXPECT_EQ(block.SetAlignment(alignment), kStatusNoError);
   return block.CheckIn();
 }
@@ -144,7 +144,7 @@ TEST_F(TDBlockTest, SettersOnHandles) {
 
   TDWBlock block;
   const int32_t empty = block.GetHashValue();
-  block.SetBlockSize(12);
+  EXPECT_EQ(block.SetBlockSize(12), kStatusNoError);
   EXPECT_NE(block.GetHashValue(), empty);
   EXPECT_EQ(TDRSizedBlock(block.CheckIn().GetImpPtr(), 1).GetBlockSize(), 12);
   EXPECT_EQ(TDRRepeatedBlock(Repeated(GetiL(), 4).GetImpPtr(), 1).GetNumBlocks(), 4u);
@@ -309,7 +309,7 @@ TEST_F(TDBlockTest, SubArrayRecordClusters) {
   ASSERT_TRUE(record);
   EXPECT_TRUE(GetSubArrayTD() == GetSubArrayTD());
   std::string name;
-  record.GetName(&name);
+  EXPECT_EQ(record.GetName(&name), kStatusNoError);
   EXPECT_EQ(name, "SubArray");
   EXPECT_EQ(record.GetEltPos(U("dimensionSpecifier")), 1);
   EXPECT_TRUE(TDRRepeatedBlock(record.GetEltTD(1).GetImpPtr(), 1).GetEltTD() == specifier);

@@ -369,7 +369,7 @@ TEST_F(TDClusterTest, ComputedPredicates) {
   EXPECT_EQ(Cluster({GetiL(), GetBoolTD()}).IsNumericClust(), 0);
   EXPECT_EQ(GetClust0TD().IsNumericClust(), 0);
   TDWInt32 generic;
-  generic.SetGenericness(1);
+  EXPECT_EQ(generic.SetGenericness(1), kStatusNoError);
   EXPECT_EQ(Cluster({GetiL(), generic.CheckIn()}).IsSemiGeneric(), 1);
   EXPECT_EQ(Cluster({GetiL(), Cluster({generic.CheckIn()})}).IsSemiGeneric(), 1);
   EXPECT_EQ(Cluster({GetiL()}).IsSemiGeneric(), 0);
@@ -389,7 +389,7 @@ TEST_F(TDClusterTest, ErrorCluster) {
   for (int32_t i = 0; i < 3; ++i) {
     EXPECT_EQ(cluster.GetEltTD(i).GetTypeCode(), codes[i]);
     std::string elementName;
-    cluster.GetEltTD(i).GetName(&elementName);
+    EXPECT_EQ(cluster.GetEltTD(i).GetName(&elementName), kStatusNoError);
     EXPECT_EQ(elementName, names[i]);
   }
   EXPECT_EQ(error.IsErrorCluster(1), 1);

@@ -41,7 +41,7 @@ TDRCluster BuildNested() {
 
 std::string NameOf(const TD& type) {
   std::string name;
-  type.GetName(&name);
+  EXPECT_EQ(type.GetName(&name), kStatusNoError);
   return name;
 }
 
@@ -382,9 +382,9 @@ TEST_F(TDContainerTest, LosslessConversion) {
     EXPECT_EQ(c.from.ConversionIsLossless(c.to), c.lossless);
   }
   TDWRepeatedBlock small;
-  small.SetEltTD(GetiB());
+  EXPECT_EQ(small.SetEltTD(GetiB()), kStatusNoError);
   TDWRepeatedBlock wide;
-  wide.SetEltTD(GetiL());
+  EXPECT_EQ(wide.SetEltTD(GetiL()), kStatusNoError);
   EXPECT_TRUE(small.ConversionIsLossless(wide));
   EXPECT_FALSE(wide.ConversionIsLossless(small));
   EXPECT_FALSE(small.ConversionIsLossless(Cluster({GetiB()})));

@@ -520,7 +520,7 @@ constexpr const char* kReversedName = "compare test: reversed";
 
 bool IsReversed(const TDR& type) {
   std::string name;
-  type.GetName(&name);
+  EXPECT_EQ(type.GetName(&name), kStatusNoError);
   return name == kReversedName;
 }
 

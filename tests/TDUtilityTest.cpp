@@ -18,7 +18,7 @@ TEST_F(TDUtilityTest, ScalarTypes) {
   TDWCluster cluster;
   cluster << GetiL();
   TDWRepeatedBlock repeated;
-  repeated.SetEltTD(GetiL());
+  EXPECT_EQ(repeated.SetEltTD(GetiL()), kStatusNoError);
   struct Case {
     const char* name;
     TDR type;

@@ -34,13 +34,13 @@ class RandomTypes {
         return GetPathTD();
       case 6: {
         TDWBlock block;
-        block.SetBlockSize(Pick(5));
+        EXPECT_EQ(block.SetBlockSize(Pick(5)), kStatusNoError);
         return block.CheckIn();
       }
       case 7: {
         TDWRepeatedBlock repeated;
-        repeated.SetEltTD(Make(depth - 1));
-        repeated.SetNumBlocks(static_cast<uint32_t>(Pick(3)));
+        EXPECT_EQ(repeated.SetEltTD(Make(depth - 1)), kStatusNoError);
+        EXPECT_EQ(repeated.SetNumBlocks(static_cast<uint32_t>(Pick(3))), kStatusNoError);
         return repeated.CheckIn();
       }
       case 8:
@@ -52,7 +52,7 @@ class RandomTypes {
         const int32_t kind = pick == 8 ? 0 : 1 + Pick(2);
         for (int32_t d = 0, n = 1 + Pick(2); d < n; ++d) {
           const int32_t size = Pick(3);
-          array.AddDim(kind == 0 ? vellum::bound::kVariable : kind == 1 ? size : vellum::bound::Fixed(size));
+          EXPECT_EQ(array.AddDim(kind == 0 ? vellum::bound::kVariable : kind == 1 ? size : vellum::bound::Fixed(size)), kStatusNoError);
         }
         return array.CheckIn();
       }
