@@ -79,7 +79,7 @@ TDR ArrayOf(const TDR& element, const std::vector<int32_t>& words) {
 TDR WithUnits(const TDR& type) {
   TDWUnits units;
   EXPECT_EQ(units.SetUnit(kUnitSeconds, -1), 0);
-  TDWNumeric numeric(type.CheckOut().GetImpPtr(), 1);
+  TDWNumeric numeric = vellum::As<TDWNumeric>(type.CheckOut());
   EXPECT_EQ(numeric.SetUnits(units), 0);
   return numeric.CheckIn();
 }
@@ -482,7 +482,7 @@ class RandomValues {
       }
       case static_cast<int>(TypeCode::Boolean): return JsonValue(Pick(2) == 0);
       case static_cast<int>(TypeCode::String): {
-        const int32_t bound = TDRStringBase(type.GetImpPtr(), 1).GetBound();
+        const int32_t bound = vellum::As<TDRStringBase>(type).GetBound();
         return Text(bound == kVar ? Pick(6) : Pick(vellum::bound::Length(bound) + 1));
       }
       case static_cast<int>(TypeCode::Path): {
@@ -499,7 +499,7 @@ class RandomValues {
       }
       case static_cast<int>(TypeCode::Ptr): return JsonValue(nullptr);
       case static_cast<int>(TypeCode::Array): {
-        const TDRArray array(type.GetImpPtr(), 1);
+        const TDRArray array = vellum::As<TDRArray>(type);
         std::vector<int32_t> dims;
         int32_t count = 1;
         for (int32_t d = 0; d < array.GetNumDims(); ++d) {
@@ -513,13 +513,13 @@ class RandomValues {
         return JsonValue{{"dims", dims}, {"elements", elements}};
       }
       case static_cast<int>(TypeCode::RepeatedBlock): {
-        const TDRRepeatedBlock repeated(type.GetImpPtr(), 1);
+        const TDRRepeatedBlock repeated = vellum::As<TDRRepeatedBlock>(type);
         JsonValue elements = JsonValue::array();
         for (uint32_t i = 0; i < repeated.GetNumBlocks(); ++i) elements.push_back(Value(repeated.GetEltTD()));
         return elements;
       }
       case static_cast<int>(TypeCode::Cluster): {
-        const TDRCluster cluster(type.GetImpPtr(), 1);
+        const TDRCluster cluster = vellum::As<TDRCluster>(type);
         JsonValue elements = JsonValue::array();
         for (int32_t i = 0; i < cluster.GetNumElts(); ++i) elements.push_back(Value(cluster.GetEltTD(i)));
         return elements;

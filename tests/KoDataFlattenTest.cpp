@@ -82,7 +82,7 @@ TEST_F(KoDataFlattenTest, GoldenValues) {
   const TDR cluster = pair.CheckIn();
   Datum packed(cluster, DatumStart::kDefault);
   packed.Put<int8_t>(0, -2);
-  packed.Put<int32_t>(TDRCluster(cluster.GetImpPtr(), 1).GetEltOffset(1), 0x01020304);
+  packed.Put<int32_t>(vellum::As<TDRCluster>(cluster).GetEltOffset(1), 0x01020304);
   EXPECT_EQ(Flatten(cluster, packed.Data()), "FE 01 02 03 04");
 }
 

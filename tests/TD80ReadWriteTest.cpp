@@ -586,7 +586,7 @@ TEST_F(TD80ReadWriteTest, StringsAtTheLimitsLoad) {
   TDR deep;
   ASSERT_EQ(Load(ClusterChain(256, "innermost", ""), &deep), kStatusNoError);
   int32_t levels = 1;
-  for (TDR level = deep; level.IsClust() != 0; level = TDRCluster(level.GetImpPtr(), 1).GetEltTD(0)) ++levels;
+  for (TDR level = deep; level.IsClust() != 0; level = vellum::As<TDRCluster>(level).GetEltTD(0)) ++levels;
   EXPECT_EQ(levels, 256);
 
   // 2^24 - 1 descriptors when expanded.

@@ -87,7 +87,7 @@ TEST_F(TDAlignmentMarkerTest, DerivedClusterKeepsItsParentsAlignment) {
   ASSERT_EQ(derived.GetNumElts(), 3);
   const TDW marker = derived.GetEltTD(2);
   ASSERT_EQ(marker.IsAlignmentMarker(), 1);
-  EXPECT_EQ(TDWAlignmentMarker(marker.GetImpPtr(), 1).GetAlignmentSource().IsSameAs(parent), 1);
+  EXPECT_EQ(vellum::As<TDWAlignmentMarker>(marker).GetAlignmentSource().IsSameAs(parent), 1);
   EXPECT_EQ(derived.AppendEltTD(Named(GetiB(), "z")), kStatusNoError);
   // The derived element starts where a whole parent would end, not right after "y".
   EXPECT_EQ(derived.GetEltOffsetByName(U("z")), 16);

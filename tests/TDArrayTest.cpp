@@ -204,9 +204,9 @@ TEST_F(TDArrayTest, EditingDimensions) {
   // A descriptor read from a type string has no list until its payload is read.
   int32_t status = -1;
   const TDW read(GetTypeFactory(static_cast<int32_t>(TypeCode::Array))->CreateTD(nullptr, 0x40, &status), 1);
-  EXPECT_FALSE(TDWArray(read.GetImpPtr(), 1).IsWellFormed());
-  EXPECT_EQ(TDWArray(read.GetImpPtr(), 1).SetNumDims(1), kStatusNullHandle);
-  EXPECT_EQ(TDWArray(read.GetImpPtr(), 1).BoundedOrFixed(), static_cast<int32_t>(0x80000000u));
+  EXPECT_FALSE(vellum::As<TDWArray>(read).IsWellFormed());
+  EXPECT_EQ(vellum::As<TDWArray>(read).SetNumDims(1), kStatusNullHandle);
+  EXPECT_EQ(vellum::As<TDWArray>(read).BoundedOrFixed(), static_cast<int32_t>(0x80000000u));
   DebugCapture capture;
   UHandle h = nullptr;
   EXPECT_EQ(read.InflateDefData(&h, 0, 1, 0), kStatusOutOfMemory);
@@ -223,13 +223,13 @@ TEST_F(TDArrayTest, IdentityHashAndSharedVectors) {
   EXPECT_NE(column.CheckIn(), a);
   EXPECT_EQ(a.CheckOut().GetHashValue(), a.GetHashValue());
 
-  const TDRArray vector(GetDbl1DTD().GetImpPtr(), 1);
+  const TDRArray vector = vellum::As<TDRArray>(GetDbl1DTD());
   ASSERT_TRUE(vector);
   EXPECT_EQ(vector.GetEltTD(), GetfD());
   EXPECT_EQ(vector.BoundedOrFixed(), -1);
   EXPECT_EQ(&GetDbl1DTD(), &GetDbl1DTD());
   EXPECT_EQ(TDRArray(1, GetfD()), vector);
-  EXPECT_EQ(TDRArray(GetVoid1DTD().GetImpPtr(), 1).GetEltTD(), GetVoidTD());
+  EXPECT_EQ(vellum::As<TDRArray>(GetVoid1DTD()).GetEltTD(), GetVoidTD());
   EXPECT_EQ(IsScalarType(vector), 0);
   EXPECT_EQ(TDRFromSubType(vector.ConvertToSubArray()), vector);
   EXPECT_EQ(vector.ConvertToSubArray().IsSubType(), 1);
@@ -241,7 +241,7 @@ TEST_F(TDArrayTest, FactoriesWalksAndMarksReachTheElement) {
   }
   TDWArray array(2, GetiL());
   EXPECT_EQ(array.EphemeralizeTD(), 0);
-  EXPECT_EQ(TDRArray(array.CheckIn().GetImpPtr(), 1).GetEltTD().IsEphemeralTD(), 4);
+  EXPECT_EQ(vellum::As<TDRArray>(array.CheckIn()).GetEltTD().IsEphemeralTD(), 4);
   int32_t visited = 0;
   array.CheckIn().TraverseTDR(
       [](const TDR& type, void* context) {
@@ -260,7 +260,7 @@ TEST_F(TDArrayTest, MutateBooleanThroughArrays) {
   TDWArray array(1, GetBoolTD());
   TDW handle = array;
   EXPECT_EQ(MutateBooleanTD(&handle, 1), 1);
-  EXPECT_EQ(TDRArray(handle.CheckIn().GetImpPtr(), 1).GetEltTD().IsBoolU16(), 1);
+  EXPECT_EQ(vellum::As<TDRArray>(handle.CheckIn()).GetEltTD().IsBoolU16(), 1);
 }
 
 TEST_F(TDArrayTest, Compatibility) {
@@ -575,7 +575,7 @@ TEST_F(TDArrayTest, BooleanFormChange) {
   TDWArray sixteen = bytes.CheckOut();
   TDW handle = sixteen;
   MutateBooleanTD(&handle, 1);
-  const TDRArray words(handle.CheckIn().GetImpPtr(), 1);
+  const TDRArray words = vellum::As<TDRArray>(handle.CheckIn());
   Datum packed(words);
   ASSERT_EQ(bytes.CopyData(from.Slot(), packed.Slot(), nullptr, kCopyFlagBooleanForm), kStatusNoError);
   // Rows start new words, most significant bit first: 0x8000 0x8000, then 0xC000 0x8000.

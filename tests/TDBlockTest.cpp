@@ -146,8 +146,8 @@ TEST_F(TDBlockTest, SettersOnHandles) {
   const int32_t empty = block.GetHashValue();
   EXPECT_EQ(block.SetBlockSize(12), kStatusNoError);
   EXPECT_NE(block.GetHashValue(), empty);
-  EXPECT_EQ(TDRSizedBlock(block.CheckIn().GetImpPtr(), 1).GetBlockSize(), 12);
-  EXPECT_EQ(TDRRepeatedBlock(Repeated(GetiL(), 4).GetImpPtr(), 1).GetNumBlocks(), 4u);
+  EXPECT_EQ(vellum::As<TDRSizedBlock>(block.CheckIn()).GetBlockSize(), 12);
+  EXPECT_EQ(vellum::As<TDRRepeatedBlock>(Repeated(GetiL(), 4)).GetNumBlocks(), 4u);
 }
 
 TEST_F(TDBlockTest, IdentityAndOrder) {
@@ -303,8 +303,8 @@ TEST_F(TDBlockTest, ConversionOfBlocks) {
 }
 
 TEST_F(TDBlockTest, SubArrayRecordClusters) {
-  const TDRCluster specifier(GetDimensionSpecifierTD().GetImpPtr(), 1);
-  const TDRCluster record(GetSubArrayTD().GetImpPtr(), 1);
+  const TDRCluster specifier = vellum::As<TDRCluster>(GetDimensionSpecifierTD());
+  const TDRCluster record = vellum::As<TDRCluster>(GetSubArrayTD());
   ASSERT_TRUE(specifier);
   ASSERT_TRUE(record);
   EXPECT_TRUE(GetSubArrayTD() == GetSubArrayTD());
@@ -312,7 +312,7 @@ TEST_F(TDBlockTest, SubArrayRecordClusters) {
   EXPECT_EQ(record.GetName(&name), kStatusNoError);
   EXPECT_EQ(name, "SubArray");
   EXPECT_EQ(record.GetEltPos(U("dimensionSpecifier")), 1);
-  EXPECT_TRUE(TDRRepeatedBlock(record.GetEltTD(1).GetImpPtr(), 1).GetEltTD() == specifier);
+  EXPECT_TRUE(vellum::As<TDRRepeatedBlock>(record.GetEltTD(1)).GetEltTD() == specifier);
   EXPECT_EQ(specifier.GetEltTD(1).IsPtr(), 1);
 
   TestPlatform wide(8, 0, 8);

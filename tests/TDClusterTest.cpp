@@ -165,7 +165,7 @@ TEST_F(TDClusterTest, DeepElementCount) {
   const TDRCluster middle = Cluster({GetiB(), inner});
   EXPECT_EQ(Cluster({GetiB(), middle, GetiL()}).GetNumEltsDeep(), 6);
   EXPECT_EQ(GetClust0TD().GetTypeCode(), 0x50);
-  EXPECT_EQ(TDRCluster(GetClust0TD().GetImpPtr(), 1).GetNumEltsDeep(), 0);
+  EXPECT_EQ(vellum::As<TDRCluster>(GetClust0TD()).GetNumEltsDeep(), 0);
   EXPECT_TRUE(GetClust0TD() == TDRCluster());
   EXPECT_EQ(GetClust0TD().DataSize(), 0);
 }
@@ -379,7 +379,7 @@ TEST_F(TDClusterTest, ErrorCluster) {
   const TDR& error = GetErrorIOCTD();
   ASSERT_TRUE(error);
   EXPECT_TRUE(error == GetErrorIOCTD());
-  const TDRCluster cluster(error.GetImpPtr(), 1);
+  const TDRCluster cluster = vellum::As<TDRCluster>(error);
   std::string name;
   ASSERT_EQ(cluster.GetName(&name), kStatusNoError);
   EXPECT_EQ(name, "error IO");

@@ -101,15 +101,15 @@ TEST_F(TDContainerTest, CheckOutGivesAnIndependentWritableTree) {
   const TDRCluster original = BuildNested();
   TDWCluster copy = original.CheckOut();
   ASSERT_TRUE(copy);
-  TDWCluster inner(copy.GetEltTD(1).GetImpPtr(), 1);
+  TDWCluster inner = vellum::As<TDWCluster>(copy.GetEltTD(1));
   ASSERT_TRUE(inner);
   EXPECT_EQ(inner.AppendEltTD(TDWInt8()), kStatusNoError);
   EXPECT_EQ(copy.GetEltTD(0).SetName(std::string("renamed")), kStatusNoError);
-  EXPECT_EQ(TDRCluster(original.GetEltTD(1).GetImpPtr(), 1).GetNumElts(), 2);
+  EXPECT_EQ(vellum::As<TDRCluster>(original.GetEltTD(1)).GetNumElts(), 2);
   EXPECT_EQ(NameOf(original.GetEltTD(0)), "text");
   EXPECT_FALSE(copy.CheckIn() == original);
   // The read-only handle offers no writable element.
-  EXPECT_FALSE(TDWMultiContainer(original.GetImpPtr(), 1));
+  EXPECT_FALSE(vellum::As<TDWMultiContainer>(original));
 }
 
 TEST_F(TDContainerTest, EditingTheElementList) {
@@ -177,7 +177,7 @@ TEST_F(TDContainerTest, ChainAppendsAndBreaksOnTheFirstFailure) {
   EXPECT_EQ(inner.ReplaceEltTDAt(outer, 0), kStatusBadArgument);
   EXPECT_EQ(capture.Texts().size(), 2u);
   // Through the multi-container handle the chain keeps that type.
-  TDWMultiContainer multi(TDWCluster().GetImpPtr(), 1);
+  TDWMultiContainer multi = vellum::As<TDWMultiContainer>(TDWCluster());
   TDWMultiContainer& chained = multi << GetiL() << GetiB();
   EXPECT_TRUE(chained);
   EXPECT_EQ(multi.GetNumElts(), 2);
@@ -310,7 +310,7 @@ TEST_F(TDContainerTest, EphemeralMarkReachesEveryElement) {
   const TDW nested = cluster.GetEltTD(1);
   ASSERT_TRUE(nested);  // an interned element was replaced by a marked writable copy
   EXPECT_EQ(nested.IsEphemeralTD(), 4);
-  EXPECT_EQ(TDWCluster(nested.GetImpPtr(), 1).GetEltTD(0).IsEphemeralTD(), 4);
+  EXPECT_EQ(vellum::As<TDWCluster>(nested).GetEltTD(0).IsEphemeralTD(), 4);
   EXPECT_EQ(shared.IsEphemeralTD(), 0);
   EXPECT_EQ(shared.GetEltTD(0).IsEphemeralTD(), 0);
 
@@ -327,7 +327,7 @@ TEST_F(TDContainerTest, BooleanMutationThroughContainers) {
   EXPECT_EQ(MutateBooleanTD(&cluster, 1), 1);
   EXPECT_EQ(cluster.GetEltTD(0).IsBoolU16(), 1);
   EXPECT_EQ(NameOf(cluster.GetEltTD(0)), "flag");
-  EXPECT_EQ(TDWCluster(cluster.GetEltTD(1).GetImpPtr(), 1).GetEltTD(0).IsBoolU16(), 1);
+  EXPECT_EQ(vellum::As<TDWCluster>(cluster.GetEltTD(1)).GetEltTD(0).IsBoolU16(), 1);
   EXPECT_EQ(shared.GetEltTD(0).IsBool(), 1);  // the interned original stays as it was
   EXPECT_EQ(MutateBooleanTD(&cluster, 1), 0);
   EXPECT_EQ(MutateBooleanTD(&cluster, 0), 1);

@@ -93,9 +93,9 @@ TEST_F(TDDataTypeTest, ConversionsOfNullHandles) {
   EXPECT_TRUE(in == GNullTD());
   EXPECT_TRUE(TDWNull().CheckIn().IsNull());
   EXPECT_TRUE(TDW().Clone().IsNull());
-  const TDRBoolean refused(TDWVoid().GetImpPtr(), 1);
+  const TDRBoolean refused = vellum::As<TDRBoolean>(TDWVoid());
   EXPECT_TRUE(refused.CheckOut().IsNull());
-  EXPECT_TRUE(TDWBoolean(GetVoidTD().GetImpPtr(), 1).CheckIn().IsNull());
+  EXPECT_TRUE(vellum::As<TDWBoolean>(GetVoidTD()).CheckIn().IsNull());
 }
 
 TEST_F(TDDataTypeTest, TypedConversionsKeepTheKind) {
@@ -419,7 +419,7 @@ TEST_F(TDDataTypeTest, WalksOverWhatExists) {
     EXPECT_EQ(c.type.ContainsTypedef(), c.containsTypedef);
     EXPECT_EQ(c.type.TypedefsPathized(), c.typedefsPathized);
     EXPECT_EQ(c.type.ContainsVariantAsData(), 0);
-    const TDR asRead(c.type.GetImpPtr(), 1);
+    const TDR asRead = vellum::As<TDR>(c.type);
     EXPECT_EQ(asRead.GetContextRecursive(), nullptr);
     EXPECT_FALSE(asRead.HoldsContextRecursive());
   }

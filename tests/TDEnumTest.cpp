@@ -89,7 +89,7 @@ Loaded Load(const Bytes& bytes) {
   return loaded;
 }
 
-TDREnum EnumOf(const TDR& type) { return TDRBasicNumeric(type.GetImpPtr(), 1).GetEnum(); }
+TDREnum EnumOf(const TDR& type) { return vellum::As<TDRBasicNumeric>(type).GetEnum(); }
 
 int32_t Sign(int32_t value) { return (value > 0) - (value < 0); }
 

@@ -102,7 +102,7 @@ TEST_F(TDNumericTest, EveryKindHasItsConstants) {
     EXPECT_EQ(shared.IsFixedPoint(), 0);
     EXPECT_EQ(shared.DataSize(), k.size);
 
-    const TDRNumeric numeric(shared.GetImpPtr(), 1);
+    const TDRNumeric numeric = vellum::As<TDRNumeric>(shared);
     ASSERT_TRUE(numeric);
     EXPECT_EQ(numeric.IsSigned(), k.isSigned);
     EXPECT_EQ(numeric.IsFractional(), k.isFractional);
@@ -144,7 +144,7 @@ TEST_F(TDNumericTest, RangesAndStepsAreExactFixedPointValues) {
   };
   for (const Case& c : kCases) {
     SCOPED_TRACE(c.code);
-    const TDRNumeric numeric(DefaultOf(c.code).GetImpPtr(), 1);
+    const TDRNumeric numeric = vellum::As<TDRNumeric>(DefaultOf(c.code));
     EXPECT_EQ(numeric.RangeMin(), c.min);
     EXPECT_EQ(numeric.RangeMax(), c.max);
     EXPECT_EQ(numeric.Delta(), c.delta);
@@ -153,7 +153,7 @@ TEST_F(TDNumericTest, RangesAndStepsAreExactFixedPointValues) {
     EXPECT_EQ(numeric.RangeMin().iwl(), c.wl);
     EXPECT_EQ(numeric.RangeMax().isSigned(), c.isSigned);
   }
-  const TDRNumeric float64(GetfD().GetImpPtr(), 1);
+  const TDRNumeric float64 = vellum::As<TDRNumeric>(GetfD());
   EXPECT_TRUE(float64.Delta().isZero());
   EXPECT_TRUE(float64.RangeMin().isNegative());
   EXPECT_GT(float64.RangeMax(), FXP(uint64_t{UINT64_MAX}));
@@ -184,11 +184,11 @@ TEST_F(TDNumericTest, TypeCodeFollowsEnumerationAndUnits) {
   };
   for (const Case& c : kCases) {
     SCOPED_TRACE(c.code);
-    TDWBasicNumeric withEnum(MakeDefaultTDWForTypeCode(c.code).GetImpPtr(), 1);
+    TDWBasicNumeric withEnum = vellum::As<TDWBasicNumeric>(MakeDefaultTDWForTypeCode(c.code));
     ASSERT_EQ(withEnum.SetEnum(MakeEnum({"x"})), 0);
     EXPECT_EQ(withEnum.GetTypeCode(), c.withEnum);
     EXPECT_EQ(withEnum.HasEnum(), 1);
-    TDWBasicNumeric withUnits(MakeDefaultTDWForTypeCode(c.code).GetImpPtr(), 1);
+    TDWBasicNumeric withUnits = vellum::As<TDWBasicNumeric>(MakeDefaultTDWForTypeCode(c.code));
     ASSERT_EQ(withUnits.SetUnits(Meters(1)), 0);
     EXPECT_EQ(withUnits.GetTypeCode(), c.withUnits);
     EXPECT_EQ(withUnits.HasUnits(), 1);
@@ -204,20 +204,20 @@ TEST_F(TDNumericTest, TypedHandlesAdmitTheirCodes) {
   ASSERT_EQ(enumerated.GetTypeCode(), 0x17);
   ASSERT_EQ(withUnits.GetTypeCode(), 0x1A);
 
-  EXPECT_TRUE(TDRUInt32(enumerated.GetImpPtr(), 1));
-  EXPECT_TRUE(TDRUInt32(GetuL().GetImpPtr(), 1));
+  EXPECT_TRUE(vellum::As<TDRUInt32>(enumerated));
+  EXPECT_TRUE(vellum::As<TDRUInt32>(GetuL()));
   EXPECT_FALSE(TDRUInt32(GetuL().GetImpPtr(), 0));
-  EXPECT_FALSE(TDRUInt16(enumerated.GetImpPtr(), 1));
-  EXPECT_TRUE(TDRFloat64(withUnits.GetImpPtr(), 1));
-  EXPECT_FALSE(TDRInt32(GetiW().GetImpPtr(), 1));
-  EXPECT_FALSE(TDRUInt64(GetuL().GetImpPtr(), 1));
-  EXPECT_TRUE(TDRBasicNumeric(enumerated.GetImpPtr(), 1));
-  EXPECT_FALSE(TDRNumeric(GetBoolTD().GetImpPtr(), 1));
+  EXPECT_FALSE(vellum::As<TDRUInt16>(enumerated));
+  EXPECT_TRUE(vellum::As<TDRFloat64>(withUnits));
+  EXPECT_FALSE(vellum::As<TDRInt32>(GetiW()));
+  EXPECT_FALSE(vellum::As<TDRUInt64>(GetuL()));
+  EXPECT_TRUE(vellum::As<TDRBasicNumeric>(enumerated));
+  EXPECT_FALSE(vellum::As<TDRNumeric>(GetBoolTD()));
   // The unchecked form holds anything it is given.
   EXPECT_TRUE(TDRNumeric(GetBoolTD().GetImpPtr(), 1, 0));
   EXPECT_FALSE(TDRNumeric(GetBoolTD().GetImpPtr(), 0, 0));
   // Writable handles never hold interned objects.
-  EXPECT_FALSE(TDWFloat64(withUnits.GetImpPtr(), 1));
+  EXPECT_FALSE(vellum::As<TDWFloat64>(withUnits));
   // The abstract kinds have no default object.
   EXPECT_FALSE(TDRNumeric());
   EXPECT_FALSE(TDWBasicNumeric());
@@ -256,10 +256,10 @@ TEST_F(TDNumericTest, NumFlagsKeepTwoDescriptorsApart) {
   const TDR b = second.CheckIn();
   EXPECT_NE(a, b);
   EXPECT_EQ(a, GetfD());
-  EXPECT_EQ(TDRBasicNumeric(b.GetImpPtr(), 1).GetNumFlags(), 0x40);
+  EXPECT_EQ(vellum::As<TDRBasicNumeric>(b).GetNumFlags(), 0x40);
   EXPECT_NE(a.GetHashValue(), b.GetHashValue());
   // Checking out keeps the byte, and the same byte interns to the same object.
-  TDWBasicNumeric again = TDRBasicNumeric(b.GetImpPtr(), 1).CheckOut();
+  TDWBasicNumeric again = vellum::As<TDRBasicNumeric>(b).CheckOut();
   EXPECT_EQ(again.GetNumFlags(), 0x40);
   EXPECT_EQ(again.CheckIn(), b);
   EXPECT_NE(again.CompareForSorting(a), 0);
@@ -282,7 +282,7 @@ TEST_F(TDNumericTest, EqualDescriptorsInternToOneObject) {
   EXPECT_NE(m2, GetfS());
 
   // Members of an interned descriptor are interned too.
-  EXPECT_EQ(TDRFloat32(m2.GetImpPtr(), 1).GetUnits(), Meters(2).CheckIn());
+  EXPECT_EQ(vellum::As<TDRFloat32>(m2).GetUnits(), Meters(2).CheckIn());
 }
 
 TEST_F(TDNumericTest, CheckOutGivesPrivateMembers) {
@@ -717,7 +717,7 @@ TEST_F(TDNumericTest, ConversionRefusals) {
   EXPECT_EQ(GetiL().CopyDataConvert(GetiB(), nullptr, out, 0), 1);
   EXPECT_EQ(out[0], 0xAA);
 
-  const TDRNumeric int32(GetiL().GetImpPtr(), 1);
+  const TDRNumeric int32 = vellum::As<TDRNumeric>(GetiL());
   EXPECT_EQ(int32.ConvertToNumeric(&value, GetBoolTD(), out), 0);
   EXPECT_EQ(int32.ConvertFromNumeric(GetBoolTD(), &value, out), 0);
   EXPECT_EQ(out[0], 0xAA);
@@ -885,12 +885,12 @@ TEST_F(TDNumericTest, CompareDataOrdersValues) {
     uint8_t b[20] = {};
     ASSERT_EQ(ConvertNumTDR(GetfD(), &c.a, c.type, a, 0), 0);
     ASSERT_EQ(ConvertNumTDR(GetfD(), &c.b, c.type, b, 0), 0);
-    EXPECT_EQ(TDRNumeric(c.type.GetImpPtr(), 1).CompareData(a, b), c.expected);
+    EXPECT_EQ(vellum::As<TDRNumeric>(c.type).CompareData(a, b), c.expected);
   }
   // Complex values compare as bytes.
   const float x[2] = {1.0f, 2.0f};
   const float y[2] = {1.0f, 3.0f};
-  const TDRNumeric complex(GetcS().GetImpPtr(), 1);
+  const TDRNumeric complex = vellum::As<TDRNumeric>(GetcS());
   EXPECT_EQ(complex.CompareData(x, x), 0);
   EXPECT_NE(complex.CompareData(x, y), 0);
   EXPECT_EQ(complex.CompareData(x, y) < 0, std::memcmp(x, y, 8) < 0);
@@ -917,26 +917,26 @@ TEST_F(TDNumericTest, MostSignificantDecimalDigit) {
     const Kind& kind = kAllKinds[NumBaseCode(c.type.GetTypeCode()) - 1];
     uint8_t data[20] = {};
     Encode(kind, c.value, 0, data);
-    EXPECT_EQ(TDRNumeric(c.type.GetImpPtr(), 1).MSDecimalDigitPos(data), c.expected);
+    EXPECT_EQ(vellum::As<TDRNumeric>(c.type).MSDecimalDigitPos(data), c.expected);
   }
 }
 
 TEST_F(TDNumericTest, DecimalDigitsRefusals) {
   DebugCapture capture;
-  EXPECT_EQ(TDRNumeric(GetuQ().GetImpPtr(), 1).DecimalDigitsForAutoPrecision(), 20);
+  EXPECT_EQ(vellum::As<TDRNumeric>(GetuQ()).DecimalDigitsForAutoPrecision(), 20);
   ASSERT_EQ(capture.Texts(), std::vector<std::string>{"Not yet supported"});
   EXPECT_EQ(capture.Messages()[0].level, 3);
   capture.Clear();
   // A code with its modifier counts as its base code.
-  EXPECT_EQ(TDRNumeric(EnumU16({"a"}).GetImpPtr(), 1).DecimalDigitsForAutoPrecision(), 5);
-  EXPECT_EQ(TDRNumeric(TDRComplex128(Meters(1), nullptr).GetImpPtr(), 1).DecimalDigitsForAutoPrecision(), 13);
+  EXPECT_EQ(vellum::As<TDRNumeric>(EnumU16({"a"})).DecimalDigitsForAutoPrecision(), 5);
+  EXPECT_EQ(vellum::As<TDRNumeric>(TDRComplex128(Meters(1), nullptr)).DecimalDigitsForAutoPrecision(), 13);
   EXPECT_TRUE(capture.Texts().empty());
 }
 
 TEST_F(TDNumericTest, InitializeDataZeroesOneValue) {
   uint8_t data[24];
   std::memset(data, 0xCD, sizeof data);
-  TDRNumeric(GetcX().GetImpPtr(), 1).InitializeData(data);
+  vellum::As<TDRNumeric>(GetcX()).InitializeData(data);
   for (int i = 0; i < 20; ++i) EXPECT_EQ(data[i], 0) << i;
   for (int i = 20; i < 24; ++i) EXPECT_EQ(data[i], 0xCD) << i;
 }
@@ -955,7 +955,7 @@ TEST_F(TDNumericTest, RepresentationEnumeration) {
                           "Word",               "Byte",             "Unsigned Long",    "Unsigned Word",
                           "Unsigned Byte",      "Complex Extended", "Complex Double",   "Complex Single",
                           "Quad",               "Unsigned Quad",    "Fixed-Point"};
-  const TDREnum items = TDRBasicNumeric(representation.GetImpPtr(), 1).GetEnum();
+  const TDREnum items = vellum::As<TDRBasicNumeric>(representation).GetEnum();
   ASSERT_EQ(items.GetNumStrings(), expected.size());
   for (uint32_t i = 0; i < expected.size(); ++i) {
     const uint8_t* item = items.GetEltPStr(i);
@@ -969,12 +969,12 @@ TEST_F(TDNumericTest, RepresentationEnumeration) {
     if (index == 14) {
       EXPECT_EQ(code, 0x5F);
     } else {
-      EXPECT_EQ(TDRNumeric(DefaultOf(code).GetImpPtr(), 1).GetNumericRepEnumIndex(), index);
+      EXPECT_EQ(vellum::As<TDRNumeric>(DefaultOf(code)).GetNumericRepEnumIndex(), index);
     }
   }
   EXPECT_EQ(TDRNumeric::GetTCForNumericRepEnumIndex(-1), 0);
   EXPECT_EQ(TDRNumeric::GetTCForNumericRepEnumIndex(15), 0);
-  EXPECT_EQ(TDRNumeric(TDRFloat64(Meters(1), nullptr).GetImpPtr(), 1).GetNumericRepEnumIndex(), 1);
+  EXPECT_EQ(vellum::As<TDRNumeric>(TDRFloat64(Meters(1), nullptr)).GetNumericRepEnumIndex(), 1);
   EXPECT_EQ(TDRNumeric(GetBoolTD().GetImpPtr(), 1, 0).GetNumericRepEnumIndex(), -1);
 
   uint32_t value = 99;
@@ -1018,7 +1018,7 @@ TEST_F(TDNumericTest, CopyAttributesByMask) {
   EXPECT_EQ(byte.CopyAttributes(enumerated, 0x1), 1);
   EXPECT_EQ(byte.GetTypeCode(), 0x15);
   EXPECT_EQ(byte.GetEnum().AppendString("b"), 0);
-  EXPECT_EQ(TDRUInt8(enumerated.GetImpPtr(), 1).GetEnum().GetNumStrings(), 1u);
+  EXPECT_EQ(vellum::As<TDRUInt8>(enumerated).GetEnum().GetNumStrings(), 1u);
 }
 
 TEST_F(TDNumericTest, DebugDump) {

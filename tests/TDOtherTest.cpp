@@ -65,7 +65,7 @@ TEST_F(TDOtherTest, Kinds) {
   EXPECT_EQ(TDRPtrTo().IsSingleContainer(), 1);
   EXPECT_TRUE(TDRCStr(U("c")) == TDWCStr(U("c")).CheckIn());
   EXPECT_FALSE(TDRCStr() == TDRPStr());
-  EXPECT_TRUE(TDRPtr(TDRCStr().GetImpPtr(), 1).IsNull());
+  EXPECT_TRUE(vellum::As<TDRPtr>(TDRCStr()).IsNull());
 }
 
 TEST_F(TDOtherTest, CallerOwnedStringsAreNeverCopied) {
@@ -102,7 +102,7 @@ TEST_F(TDOtherTest, PointersCopyTheirValue) {
   TDWPtrTo pointer;
   ASSERT_EQ(pointer.SetEltTD(TDWFloat64()), kStatusNoError);
   const TDR toDouble = pointer.CheckIn();
-  EXPECT_TRUE(TDRPtrTo(toDouble.GetImpPtr(), 1).GetEltTD() == GetfD());
+  EXPECT_TRUE(vellum::As<TDRPtrTo>(toDouble).GetEltTD() == GetfD());
   EXPECT_FALSE(toDouble == TDRPtrTo());
   dst = nullptr;
   EXPECT_EQ(toDouble.CopyData(&src, &dst, nullptr, 0), kStatusNoError);

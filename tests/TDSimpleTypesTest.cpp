@@ -70,12 +70,12 @@ TEST_F(TDSimpleTypesTest, EventDiscardMask) {
     discarding.PrintDebugStr();
     EXPECT_EQ(capture.Texts(), (std::vector<std::string>{"TypeDescriptor {", "\tattributes = 0x00000003", "\t}"}));
   }
-  EXPECT_TRUE(TDWBoolean(discarding.GetImpPtr(), 1).IsNull());
-  TDWBoolean out = TDRBoolean(discarding.GetImpPtr(), 1).CheckOut();
+  EXPECT_TRUE(vellum::As<TDWBoolean>(discarding).IsNull());
+  TDWBoolean out = vellum::As<TDRBoolean>(discarding).CheckOut();
   EXPECT_TRUE(out.CheckIn() == discarding) << "check-out keeps the mask";
   EXPECT_EQ(out.SetEventDiscardMask(0), kStatusNoError);
   EXPECT_TRUE(out.CheckIn() == GetBoolTD());
-  EXPECT_EQ(TDWBoolean(GetVoidTD().GetImpPtr(), 1).SetEventDiscardMask(1), kStatusNullHandle);
+  EXPECT_EQ(vellum::As<TDWBoolean>(GetVoidTD()).SetEventDiscardMask(1), kStatusNullHandle);
 }
 
 TEST_F(TDSimpleTypesTest, MutateBooleanKeepsOnlyTheName) {
@@ -88,7 +88,7 @@ TEST_F(TDSimpleTypesTest, MutateBooleanKeepsOnlyTheName) {
     EXPECT_EQ(type.EphemeralizeTD(), 0);
     EXPECT_EQ(type.SetGenericness(1), kStatusNoError);
     if (type.IsBool() != 0) {
-      EXPECT_EQ(TDWBoolean(type.GetImpPtr(), 1).SetEventDiscardMask(1), kStatusNoError);
+      EXPECT_EQ(vellum::As<TDWBoolean>(type).SetEventDiscardMask(1), kStatusNoError);
     }
     return type;
   };

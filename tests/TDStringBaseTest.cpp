@@ -80,14 +80,14 @@ TEST_F(TDStringBaseTest, KindsAndSharedDefaults) {
     EXPECT_EQ(c.type.DataSize(), c.size);
     EXPECT_EQ(c.type.GetAlignment(), 8);
     EXPECT_EQ(c.type.DataShape(), kDataShapeStringLike);
-    EXPECT_EQ(TDRStringBase(c.type.GetImpPtr(), 1).GetBound(), -1);
+    EXPECT_EQ(vellum::As<TDRStringBase>(c.type).GetBound(), -1);
     EXPECT_EQ(ToString(c.type), c.text);
   }
   EXPECT_TRUE(TDRString() == GetStringTD());
   EXPECT_TRUE(TDRSubString(nullptr, -1) == GetSubStringTD());
   EXPECT_EQ(GetSubStringTD().IsSubType(), 1);
-  EXPECT_TRUE(TDRString(GetPathTD().GetImpPtr(), 1).IsNull()) << "admission by kind";
-  EXPECT_TRUE(TDRStringBase(GetiL().GetImpPtr(), 1).IsNull());
+  EXPECT_TRUE(vellum::As<TDRString>(GetPathTD()).IsNull()) << "admission by kind";
+  EXPECT_TRUE(vellum::As<TDRStringBase>(GetiL()).IsNull());
 }
 
 TEST_F(TDStringBaseTest, BoundIsIdentityAndOrder) {
@@ -103,7 +103,7 @@ TEST_F(TDStringBaseTest, BoundIsIdentityAndOrder) {
   EXPECT_LT(variable.CompareForSorting(bounded), 0);
   EXPECT_EQ(bounded.CompareForSorting(TDRString(U("named"), 5)), 0) << "names take no part in the order";
 
-  TDWString edit(bounded.CheckOut().GetImpPtr(), 1);
+  TDWString edit = vellum::As<TDWString>(bounded.CheckOut());
   EXPECT_EQ(edit.GetBound(), 5);
   EXPECT_EQ(edit.SetBound(-1), kStatusNoError);
   EXPECT_TRUE(edit.CheckIn() == variable);
@@ -507,13 +507,13 @@ TEST_F(TDStringBaseTest, LayoutForAnotherPlatform) {
     EXPECT_EQ(GetStringTD().DataSize(&platform), c.pointerSize);
     EXPECT_EQ(GetSubStringTD().GetAlignment(&platform), c.pointerSize);
     EXPECT_EQ(GetSubStringTD().DataSize(&platform), c.subStringSize);
-    const TDRSubString sub(GetSubStringTD().GetImpPtr(), 1);
+    const TDRSubString sub = vellum::As<TDRSubString>(GetSubStringTD());
     EXPECT_EQ(sub.GetStringPtrOffset(&platform), 0);
     EXPECT_EQ(sub.GetLengthOffset(&platform), c.lengthOffset);
   }
-  const TDRSubString sub(GetSubStringTD().GetImpPtr(), 1);
+  const TDRSubString sub = vellum::As<TDRSubString>(GetSubStringTD());
   EXPECT_EQ(sub.GetLengthOffset(), 8);
-  const TDRCluster record(GetSubStringRecTD().GetImpPtr(), 1);
+  const TDRCluster record = vellum::As<TDRCluster>(GetSubStringRecTD());
   ASSERT_EQ(record.GetNumElts(), 3);
   TestPlatform platform(8, 0, 8);
   EXPECT_EQ(record.GetEltOffsetByName(U("stride"), &platform), 16);

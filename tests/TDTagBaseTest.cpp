@@ -37,9 +37,9 @@ TEST_F(TDTagBaseTest, Kinds) {
 
   const TDRTag userDefined(kTagTypeUserDefined, U("u"));
   EXPECT_EQ(userDefined.IsUserDefinedTag(), 1);
-  EXPECT_TRUE(TDRUserDefinedTag(userDefined.GetImpPtr(), 1));
-  EXPECT_TRUE(TDRUserDefinedTag(plain.GetImpPtr(), 1).IsNull());
-  EXPECT_TRUE(TDRTagBase(userDefined.GetImpPtr(), 1));
+  EXPECT_TRUE(vellum::As<TDRUserDefinedTag>(userDefined));
+  EXPECT_TRUE(vellum::As<TDRUserDefinedTag>(plain).IsNull());
+  EXPECT_TRUE(vellum::As<TDRTagBase>(userDefined));
   EXPECT_TRUE(TDRTagBase().IsNull()) << "an abstract kind has no default";
 
   const TDRTag sized(7, 3, U("t"));
@@ -61,14 +61,14 @@ TEST_F(TDTagBaseTest, UserDefinedClassIsIdentity) {
   EXPECT_EQ(widget.GetTagType(), kTagTypeUserDefined);
   EXPECT_EQ(widget.GetBound(), -1);
 
-  TDWUserDefinedTag edit(widget.CheckOut().GetImpPtr(), 1);
+  TDWUserDefinedTag edit = vellum::As<TDWUserDefinedTag>(widget.CheckOut());
   ASSERT_TRUE(edit);
   EXPECT_TRUE(edit.CheckIn() == widget) << "check-out keeps the class";
   EXPECT_EQ(edit.SetTagClassCStr(U("")), kStatusNoError);
   EXPECT_TRUE(edit.CheckIn() == none);
   EXPECT_EQ(edit.SetTagClassCStr(U("Widget")), kStatusNoError);
   EXPECT_TRUE(edit.CheckIn() == widget);
-  EXPECT_EQ(TDWUserDefinedTag(GetTagTD().GetImpPtr(), 1).SetTagClass(U("\x01x")), kStatusNullHandle);
+  EXPECT_EQ(vellum::As<TDWUserDefinedTag>(GetTagTD()).SetTagClass(U("\x01x")), kStatusNullHandle);
 
   // Order: by tag kind first, then no class before a class, then the classes.
   const TDRUserDefinedTag gadget(U("\x06Gadget"));
@@ -208,7 +208,7 @@ TEST_F(TDTagBaseTest, StoredKindsOutsideTheValidOnesAreReported) {
     TDR loaded;
     EXPECT_EQ(UnFlattenOneType(nullptr, h, &loaded, nullptr), kStatusNoError);
     DSDisposeHandle(h);
-    EXPECT_EQ(TDRTag(loaded.GetImpPtr(), 1).GetTagType(), c.loaded);
+    EXPECT_EQ(vellum::As<TDRTag>(loaded).GetTagType(), c.loaded);
     EXPECT_EQ(capture.Texts(), c.messages);
   }
 }
@@ -221,7 +221,7 @@ TEST_F(TDTagBaseTest, CheckOutWithAClassSurvivesAllocationFailures) {
     const TDW copy = widget.CheckOut();
     if (!failure.Fired()) {
       EXPECT_TRUE(copy);
-      EXPECT_EQ(TDWUserDefinedTag(copy.GetImpPtr(), 1).HasTagClass(), 1);
+      EXPECT_EQ(vellum::As<TDWUserDefinedTag>(copy).HasTagClass(), 1);
       return;
     }
     EXPECT_FALSE(copy);

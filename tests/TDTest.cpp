@@ -42,7 +42,7 @@ TDW Ephemeral(TDW type) {
 }
 
 TDW EventDiscard(TDW type) {
-  EXPECT_EQ(TDWBoolean(type.GetImpPtr(), 1).SetEventDiscardMask(1), kStatusNoError);
+  EXPECT_EQ(vellum::As<TDWBoolean>(type).SetEventDiscardMask(1), kStatusNoError);
   return type;
 }
 
@@ -121,7 +121,7 @@ TEST_F(TDTest, HashOfAWritableDescriptorFollowsItsSetters) {
       {"NoSelect", [](TDW& t) { EXPECT_EQ(t.SetNoSelectMask(1), kStatusNoError); }},
       {"Generic", [](TDW& t) { EXPECT_EQ(t.SetGenericness(1), kStatusNoError); }},
       {"Ephemeral", [](TDW& t) { EXPECT_EQ(t.EphemeralizeTD(), 0); }},
-      {"EventDiscard", [](TDW& t) { EXPECT_EQ(TDWBoolean(t.GetImpPtr(), 1).SetEventDiscardMask(1), 0); }},
+      {"EventDiscard", [](TDW& t) { EXPECT_EQ(vellum::As<TDWBoolean>(t).SetEventDiscardMask(1), 0); }},
       {"Name", [](TDW& t) { EXPECT_EQ(t.SetName(std::string("renamed")), kStatusNoError); }},
       {"Typedef", [](TDW& t) { EXPECT_EQ(t.SetTypedef(Link("a:b", 3)), kStatusNoError); }},
   };

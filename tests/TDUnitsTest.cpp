@@ -88,7 +88,7 @@ Loaded Load(const Bytes& bytes) {
   return loaded;
 }
 
-TDRUnits UnitsOf(const TDR& type) { return TDRNumeric(type.GetImpPtr(), 1).GetUnits(); }
+TDRUnits UnitsOf(const TDR& type) { return vellum::As<TDRNumeric>(type).GetUnits(); }
 
 int32_t Sign(int32_t value) { return (value > 0) - (value < 0); }
 

@@ -148,7 +148,7 @@ TEST_F(TDUtilityCompareTest, NumbersOrderByKind) {
     ASSERT_EQ(ConvertNumTDR(GetfD(), &c.a, c.type, a, 0), 0);
     ASSERT_EQ(ConvertNumTDR(GetfD(), &c.b, c.type, b, 0), 0);
     EXPECT_EQ(CompareDataTDR(c.type, a, b, 0, 0), c.expected);
-    EXPECT_EQ(CompareDataTDR(c.type, a, b, 0, 0), TDRNumeric(c.type.GetImpPtr(), 1).CompareData(a, b));
+    EXPECT_EQ(CompareDataTDR(c.type, a, b, 0, 0), vellum::As<TDRNumeric>(c.type).CompareData(a, b));
     // The raw-numbers option orders the stored bytes instead.
     EXPECT_EQ(CompareDataTDRCore(c.type, false, a, b, 0, 0, 1),
               BytesOrder(a, b, static_cast<size_t>(c.type.DataSize())));
@@ -527,7 +527,7 @@ bool IsReversed(const TDR& type) {
 int32_t ReversedInt32(const TDR& type, bool nullFirst, const void* a, const void* b, int32_t variantOption,
                       int32_t bytewise, int32_t rawNumbers) {
   gSeen = SeenArguments{nullFirst, variantOption, bytewise, rawNumbers, gSeen.calls + 1};
-  return -TDRNumeric(type.GetImpPtr(), 1).CompareData(a, b);
+  return -vellum::As<TDRNumeric>(type).CompareData(a, b);
 }
 
 int32_t AlwaysSeven(const TDR&, bool, const void*, const void*, int32_t, int32_t, int32_t) { return 7; }

@@ -87,7 +87,7 @@ class TreeGrower {
         return TDWBooleanU16();
       case 3: {
         const int32_t code = 1 + Pick(14);
-        TDWBasicNumeric number(MakeDefaultTDWForTypeCode(code).GetImpPtr(), 1);
+        TDWBasicNumeric number = vellum::As<TDWBasicNumeric>(MakeDefaultTDWForTypeCode(code));
         text += "num" + std::to_string(code);
         if (Pick(3) == 0) {
           const auto flags = static_cast<uint8_t>(1 + Pick(255));
@@ -255,9 +255,9 @@ class TreeGrower {
     text += elementText + "]";
     TDWArrayBase array;
     switch (kind) {
-      case 0: array = TDWArrayBase(TDWArray(0, element).GetImpPtr(), 1); break;
-      case 1: array = TDWArrayBase(TDWSubArray(0, element).GetImpPtr(), 1); break;
-      default: array = TDWArrayBase(TDWArrayDataPtr(0, element).GetImpPtr(), 1); break;
+      case 0: array = vellum::As<TDWArrayBase>(TDWArray(0, element)); break;
+      case 1: array = vellum::As<TDWArrayBase>(TDWSubArray(0, element)); break;
+      default: array = vellum::As<TDWArrayBase>(TDWArrayDataPtr(0, element)); break;
     }
     for (const int32_t word : words) EXPECT_EQ(array.AddDim(word), kStatusNoError);
     if (Pick(5) == 0) {
@@ -324,10 +324,10 @@ class TreeGrower {
 // The descriptor whose record a type string writes first: elements go before their containers,
 // in element order.
 TDR FirstRecordOf(const TDR& type) {
-  if (const TDRSingleContainer single(type.GetImpPtr(), 1); single && single.GetEltTD()) {
+  if (const TDRSingleContainer single = vellum::As<TDRSingleContainer>(type); single && single.GetEltTD()) {
     return FirstRecordOf(single.GetEltTD());
   }
-  if (const TDRMultiContainer multi(type.GetImpPtr(), 1); multi) {
+  if (const TDRMultiContainer multi = vellum::As<TDRMultiContainer>(type); multi) {
     for (int32_t i = 0; i < multi.GetNumElts(); ++i) {
       if (const TDR element = multi.GetEltTD(i)) return FirstRecordOf(element);
     }

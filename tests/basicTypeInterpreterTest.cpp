@@ -58,7 +58,7 @@ TDR PointerTo(const TDR& element) {
 TDR Units(const TDR& type) {
   TDWUnits units;
   EXPECT_EQ(units.SetUnit(kUnitSeconds, -1), 0);
-  TDWNumeric numeric(type.CheckOut().GetImpPtr(), 1);
+  TDWNumeric numeric = vellum::As<TDWNumeric>(type.CheckOut());
   EXPECT_EQ(numeric.SetUnits(units), 0);
   return numeric.CheckIn();
 }
@@ -421,7 +421,7 @@ class RichTreeMaker {
       case 4: {
         const bool isSigned = Pick(2) == 0;
         text += isSigned ? "iP" : "uP";
-        TDWNumeric wide(isSigned ? TDW(TDWInt64()).GetImpPtr() : TDW(TDWUInt64()).GetImpPtr(), 1);
+        TDWNumeric wide = vellum::As<TDWNumeric>(isSigned ? TDW(TDWInt64()) : TDW(TDWUInt64()));
         wide.SetIntPtrT();
         return wide.CheckIn();
       }

@@ -68,21 +68,21 @@ class RandomTypes {
   // Nonzero bytes for every element without handles, strings with text: a value unlike the default.
   void Fill(const TDR& type, uint8_t* data) {
     if (type.IsClust() != 0) {
-      const TDRCluster cluster(type.GetImpPtr(), 1);
+      const TDRCluster cluster = vellum::As<TDRCluster>(type);
       for (int32_t i = 0; i < cluster.GetNumElts(); ++i) Fill(cluster.GetEltTD(i), data + cluster.GetEltOffset(i));
       return;
     }
     if (type.IsRepeatedBlock() != 0) {
-      const TDRRepeatedBlock repeated(type.GetImpPtr(), 1);
+      const TDRRepeatedBlock repeated = vellum::As<TDRRepeatedBlock>(type);
       const TDR element = repeated.GetEltTD();
       for (uint32_t k = 0; k < repeated.GetNumBlocks(); ++k) Fill(element, data + k * element.DataSize());
       return;
     }
     if (type.IsArrayOnly() != 0) {
-      FillArray(TDRArray(type.GetImpPtr(), 1), data);
+      FillArray(vellum::As<TDRArray>(type), data);
       return;
     }
-    if (type.IsStringOnly() != 0 && TDRString(type.GetImpPtr(), 1).GetBound() == vellum::bound::kVariable) {
+    if (type.IsStringOnly() != 0 && vellum::As<TDRString>(type).GetBound() == vellum::bound::kVariable) {
       LStrHandle text = nullptr;
       std::memcpy(&text, data, sizeof text);
       EXPECT_EQ(StringUtils::ToLStr(std::string(static_cast<size_t>(Pick(9)), 'x'), &text), kStatusNoError);
