@@ -532,14 +532,6 @@ std::atomic<int32_t> vellum::detail::gDSAlign{0};
 
 void SetDSAlign(int32_t alignment) { vellum::detail::gDSAlign.store(alignment, std::memory_order_relaxed); }
 
-
-const TypeCodeInfo* FindTypeCode(int32_t raw) {
-  for (const TypeCodeInfo& info : kTypeCodes) {
-    if (static_cast<int32_t>(info.code) == raw) return &info;
-  }
-  return nullptr;
-}
-
 void RegisterDefaultTypeGetter(int32_t code, DefaultTypeGetter getter) {
   if (code < 0 || code > 255) return;
   DefaultGetters()[static_cast<size_t>(code)].store(getter, std::memory_order_release);
