@@ -596,8 +596,9 @@ void UnpackBooleans(const uint8_t* words, uint8_t* bytes, int64_t rows, int64_t 
   }
 }
 
-}  // namespace
-
+// The order of two blocks of packed Booleans of `rows` rows of `rowLength` elements (the layout
+// of BooleanU16 arrays): at the first differing element, 1 when a's is true, else -1; 0 when all
+// are equal.
 int32_t ComparePackedBooleans(const uint8_t* a, const uint8_t* b, int64_t rows, int64_t rowLength) {
   const int64_t wordsPerRow = (rowLength + 15) >> 4;
   for (int64_t r = 0; r < rows; ++r) {
@@ -616,6 +617,8 @@ int32_t ComparePackedBooleans(const uint8_t* a, const uint8_t* b, int64_t rows, 
   }
   return 0;
 }
+
+}  // namespace
 
 // --- counting ------------------------------------------------------------------------------------
 
@@ -1384,6 +1387,64 @@ int32_t TDArrayImp::CopyDataConvertCore(const TDImp* dst, const void* src, void*
   return ConvertArrayKind(*this, &ArraySource, "CopyArrayToSubArray", dst, src, dstData, flags);
 }
 
+// --- TDArrayImp: order of data ---------------------------------------------------------------------
+
+namespace {
+
+// One side of an array comparison: the block, or null for a null handle and for a damaged block
+// (whose elements are never read).
+struct ArraySide {
+  const uint8_t* block = nullptr;
+  int64_t count = 0;
+
+  ArraySide(const ArrayLayout& layout, const void* data) {
+    const auto h = Load<UHandle>(data);
+    if (h != nullptr && layout.ReadCount(h, &count)) {
+      block = *h;
+    } else {
+      count = 0;
+    }
+  }
+  const int32_t* Dims() const { return reinterpret_cast<const int32_t*>(block); }
+};
+
+}  // namespace
+
+DataOrder TDArrayImp::OrderData(const void* a, const void* b, const DataOrderOptions& options) const {
+  if (!IsWellFormed()) return {};
+  const ArrayLayout layout(*GetElt(), GetNumDims());
+  const ArraySide x(layout, a);
+  const ArraySide y(layout, b);
+  if (!options.nullFirst) {
+    if (x.count != y.count) return {x.count < y.count ? -1 : 1};
+    if (x.count == 0) return {};
+  } else if (x.block == nullptr || y.block == nullptr) {
+    return {x.block == y.block ? 0 : (x.block == nullptr ? 1 : -1)};
+  }
+  // Equal dimension words mean equal counts from here on.
+  const int32_t dims = BlockCmp(x.block, y.block, sizeof(int32_t) * static_cast<size_t>(layout.nDims));
+  if (dims != 0 || x.count == 0) return {dims};
+
+  const uint8_t* firstA = layout.Element(x.block, 0);
+  const uint8_t* firstB = layout.Element(y.block, 0);
+  if (layout.packed) {
+    if (options.bytewise != 0) return {BlockCmp(firstA, firstB, static_cast<size_t>(layout.Bytes(x.count, x.Dims())))};
+    const int64_t rowLength = layout.nDims > 0 ? x.Dims()[layout.nDims - 1] : 1;
+    return {ComparePackedBooleans(firstA, firstB, x.count / rowLength, rowLength)};
+  }
+  if (options.bytewise != 0 && !layout.handles) {
+    return {BlockCmp(firstA, firstB, static_cast<size_t>(x.count * layout.eltSize))};
+  }
+  // Elements of no size are all alike, however many the dimensions count.
+  if (layout.eltSize == 0) return {};
+  for (int64_t i = 0; i < x.count; ++i) {
+    const int32_t order =
+        options.compareElement(*layout.elt, layout.Element(x.block, i), layout.Element(y.block, i), options);
+    if (order != 0) return {order};
+  }
+  return {};
+}
+
 // --- TDSubArrayImp ---------------------------------------------------------------------------------
 
 TDImpPtr TDSubArrayImp::NewInstance() const { return MakeCounted<TDSubArrayImp>(); }
@@ -1433,6 +1494,10 @@ int32_t TDSubArrayImp::CopyData(const void* src, void* dst, int32_t, const KoCon
 
 int32_t TDSubArrayImp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const {
   return ConvertArrayKind(*this, &SubArraySource, "CopySubArrayToSubArray", dst, src, dstData, flags);
+}
+
+DataOrder TDSubArrayImp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  return {OrderBytes(a, b).order, DataOrderNote::SubtypeRecords};
 }
 
 // --- TDArrayDataPtrImp -----------------------------------------------------------------------------

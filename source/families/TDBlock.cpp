@@ -81,6 +81,7 @@ const bool gAnnounced = [] {
 }();
 
 uint8_t* At(void* data, int64_t offset) { return static_cast<uint8_t*>(data) + offset; }
+const uint8_t* At(const void* data, int64_t offset) { return static_cast<const uint8_t*>(data) + offset; }
 
 }  // namespace
 
@@ -502,6 +503,20 @@ int32_t TDRepeatedBlockImp::CompareForSorting(const TDImp* other) const {
   const TDRepeatedBlockImp* that = AsRepeatedBlock(other);
   if (byElement != 0 || that == nullptr) return byElement;
   return Order(numBlocks_, that->numBlocks_);
+}
+
+DataOrder TDRepeatedBlockImp::OrderData(const void* a, const void* b, const DataOrderOptions& options) const {
+  if (options.bytewise != 0 && DataShapeOf(1) == kDataShapePlain) return OrderBytes(a, b);
+  const TDImp* element = GetElt().get();
+  if (element == nullptr) return {};
+  const int64_t size = std::max(element->DataSizeCore(nullptr), 0);
+  // Copies of nothing are all alike, however many the count says there are.
+  if (size == 0) return {};
+  for (uint32_t k = 0; k < numBlocks_; ++k) {
+    const int32_t order = options.compareElement(*element, At(a, size * k), At(b, size * k), options);
+    if (order != 0) return {order};
+  }
+  return {};
 }
 
 void TDRepeatedBlockImp::PrintDebugStr(const uint8_t* prefix) const {

@@ -545,6 +545,13 @@ int32_t TDClusterImp::CopyDataConvertCore(const TDImp* dst, const void* src, voi
   return kStatusBadArgument;
 }
 
+DataOrder TDClusterImp::OrderData(const void* a, const void* b, const DataOrderOptions& options) const {
+  if (options.bytewise != 0 && DataShapeOf(1) == kDataShapePlain) return OrderBytes(a, b);
+  return {ForEachElt([&](const TDImp& element, int64_t offset) {
+    return options.compareElement(element, At(a, offset), At(b, offset), options);
+  })};
+}
+
 // --- compatibility ---------------------------------------------------------------------------------
 
 int32_t TDClusterImp::CmpTD(const TDImp* source, int32_t flags, int32_t) const {

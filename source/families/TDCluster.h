@@ -52,6 +52,9 @@ class TDClusterImp : public TDMultiContainerImp {
   int32_t IsErrorCluster(int32_t strict) const override;
   // Some element is generic or semi-generic.
   int32_t IsSemiGeneric() const override;
+  // Element by element in order, the first that differs deciding; bytewise, the bytes when no
+  // element holds handles.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
   // The interned copy also records its layout for the SetDSAlign value in force (2 when memory
   // runs out).

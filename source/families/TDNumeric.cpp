@@ -916,6 +916,10 @@ TDImpPtr vellum::detail::NewBasicNumeric(TypeCode code, const uint8_t* name, con
   return fresh;
 }
 
+DataOrder TDNumericImp::OrderData(const void* a, const void* b, const DataOrderOptions& options) const {
+  return options.rawNumbers != 0 ? OrderBytes(a, b) : DataOrder{CompareData(a, b)};
+}
+
 int32_t CompareNumericData(const TDImp* type, const void* a, const void* b) {
   const TDNumericImp* numeric = AsNumeric(type);
   return numeric != nullptr ? numeric->CompareData(a, b) : 0;

@@ -17,6 +17,8 @@ class TDNumericImp : public TDImp {
   // Complex only into complex of at least the word length; integers by range and step; floating
   // only into floating of at least the word length.
   bool ConversionIsLossless(const TDImp* dst) const override;
+  // By value (CompareData); by the bytes when the options ask for raw numbers.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
   // --- slots 179 to 202 ------------------------------------------------------------------------
   virtual int32_t SupportsUnits() const { return 0; }

@@ -51,6 +51,16 @@ int32_t ConvertBoolean(const TDImp& self, const TDImp* dst, const void* src, voi
   return kStatusBadArgument;
 }
 
+// Any two values that differ order by `a` alone: a true `a` sorts after `b`, a false one before.
+DataOrder OrderBooleans(const void* a, const void* b, size_t size) {
+  if (BlockCmp(a, b, size) == 0) return {};
+  const auto* bytes = static_cast<const uint8_t*>(a);
+  for (size_t i = 0; i < size; ++i) {
+    if (bytes[i] != 0) return {1};
+  }
+  return {-1};
+}
+
 // Replaces *self by a fresh object of kind `Other` carrying only the name.
 template <class Other>
 int32_t MutateTo(TDImpPtr* self) {
@@ -84,6 +94,10 @@ int32_t TDBooleanImp::CopyDataConvertCore(const TDImp* dst, const void* src, voi
   return ConvertBoolean(*this, dst, src, dstData, 1);
 }
 
+DataOrder TDBooleanImp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  return OrderBooleans(a, b, sizeof(uint8_t));
+}
+
 int32_t TDBooleanImp::MutateBooleanTD(TDImpPtr* self, int32_t toOld) {
   return toOld != 0 ? MutateTo<TDBooleanU16Imp>(self) : 0;
 }
@@ -106,6 +120,10 @@ int32_t TDBooleanU16Imp::CopyData(const void* src, void* dst, int32_t, const KoC
 
 int32_t TDBooleanU16Imp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t) const {
   return ConvertBoolean(*this, dst, src, dstData, 2);
+}
+
+DataOrder TDBooleanU16Imp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  return OrderBooleans(a, b, sizeof(uint16_t));
 }
 
 int32_t TDBooleanU16Imp::MutateBooleanTD(TDImpPtr* self, int32_t toOld) {

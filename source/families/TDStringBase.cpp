@@ -14,6 +14,7 @@
 #include "runtime/DSMemory.h"
 #include "runtime/DebugStream.h"
 #include "runtime/HandleAllocation.h"
+#include "runtime/PXPath.h"
 #include "runtime/PXStrings.h"
 #include "source/model/MoveBytes.h"
 #include "source/model/TDAttributes.h"
@@ -902,4 +903,28 @@ int32_t TDPathImp::ReadData(KoDataReader* reader, void* data, int32_t count, int
   }
   if (status != nullptr) *status = reader->GetError();
   return static_cast<int32_t>(reader->Position() - start);
+}
+
+// --- ordering of data ------------------------------------------------------------------------------
+
+DataOrder TDStringBaseImp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  return {LHStrCmp(Load<LStrHandle>(a), Load<LStrHandle>(b))};
+}
+
+DataOrder TDSubStringImp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  return {OrderBytes(a, b).order, DataOrderNote::SubtypeRecords};
+}
+
+DataOrder TDPathImp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  const auto first = Load<Path>(a);
+  const auto second = Load<Path>(b);
+  if (first != nullptr && second != nullptr) return {FPathCmpExact(first, second)};
+  Path notAPath = nullptr;
+  if (FNotAPath(&notAPath) != kStatusNoError) {
+    FDestroyPath(&notAPath);
+    return {FPathCmpExact(first, second)};
+  }
+  const int32_t order = FPathCmpExact(first != nullptr ? first : notAPath, second != nullptr ? second : notAPath);
+  FDestroyPath(&notAPath);
+  return {order};
 }

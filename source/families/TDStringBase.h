@@ -58,6 +58,8 @@ class TDStringBaseImp : public TDImp {
   // By bound word, smaller first.
   int32_t CompareForSorting(const TDImp* other) const override;
   int32_t IsStringBase() const override { return 1; }
+  // The bytes, as LHStrCmp orders them; a null handle is the empty string.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
   // --- members ---------------------------------------------------------------------------------
   int32_t GetBound() const noexcept { return bound_; }
@@ -121,6 +123,8 @@ class TDSubStringImp final : public TDStringBaseImp {
   int32_t IsString() const override { return 1; }
   int32_t IsSubStringOnly() const override { return 1; }
   int32_t IsSubType() const override { return 1; }
+  // The records' bytes, not the bytes they view (noted as such).
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
  protected:
   const char* KindText() const override { return "substring"; }
@@ -149,6 +153,8 @@ class TDPathImp final : public TDStringBaseImp {
   int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
   int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsPath() const override { return 1; }
+  // FPathCmpExact; a null path orders as not-a-path, which is how it is flattened.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
  protected:
   const char* KindText() const override { return "path"; }

@@ -2,6 +2,7 @@
 // check-out, flags, type compatibility framework, traversal, the debug dump and the short text.
 #include "source/model/TD.h"
 
+#include <algorithm>
 #include <array>
 #include <atomic>
 #include <cstring>
@@ -9,6 +10,7 @@
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
 #include "source/model/CoreTDTable.h"
+#include "source/model/MoveBytes.h"
 #include "source/model/TDAttributes.h"
 #include "source/model/TypeManager.h"
 #include "source/streams/KoCMutate.h"
@@ -358,6 +360,24 @@ int32_t TDImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t
   }
   if (status != nullptr) *status = reader->GetError();
   return static_cast<int32_t>(reader->Position() - start);
+}
+
+// --- ordering of data ------------------------------------------------------------------------------
+
+DataOrder TDImp::OrderBytes(const void* a, const void* b) const {
+  return {BlockCmp(a, b, static_cast<size_t>(std::max(DataSizeCore(nullptr), 0)))};
+}
+
+DataOrder TDImp::OrderData(const void* a, const void* b, const DataOrderOptions& options) const {
+  if (GetTypeCode() != static_cast<int16_t>(TypeCode::Refnum)) return {0, DataOrderNote::NoOrder};
+  // A refnum's datum is its cookie, an unsigned number of its size.
+  if (options.bytewise != 0) return OrderBytes(a, b);
+  const auto order = [](auto x, auto y) { return DataOrder{x < y ? -1 : (y < x ? 1 : 0)}; };
+  switch (DataSizeCore(nullptr)) {
+    case sizeof(uint64_t): return order(Load<uint64_t>(a), Load<uint64_t>(b));
+    case sizeof(uint32_t): return order(Load<uint32_t>(a), Load<uint32_t>(b));
+    default: return {0, DataOrderNote::UnsupportedRefnumSize};
+  }
 }
 
 int32_t TDImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {

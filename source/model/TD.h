@@ -70,6 +70,39 @@ constexpr int32_t kCmpFlagEphemeralMatters = 0x10000000;
 using TDVisitFn = TDTraverseValue (*)(TDImp* td, void* context, TDImpPtr* replacement);
 using TDShouldRecurseFn = bool (*)(TDImp* td, void* context);
 
+// What a kind's order of two data says besides the order. Ordering reports what it has to say
+// from one module, so a kind hands back a note and the caller writes the message.
+enum class DataOrderNote : uint8_t {
+  None,
+  NoOrder,                // the kind has no order: its data compare equal
+  SubtypeRecords,         // a subtype's records were compared as bytes, not what they view
+  UnsupportedRefnumSize,  // a refnum of neither 4 nor 8 bytes: its data compare equal
+};
+
+struct DataOrder {
+  int32_t order = 0;  // negative, 0 or positive, as a three-way comparison
+  DataOrderNote note = DataOrderNote::None;
+};
+
+struct DataOrderOptions;
+// The whole comparison of one datum of `type`, registered comparisons included; 0 when either
+// datum is null.
+using ElementComparison = int32_t (*)(const TDImp& type, const void* a, const void* b, const DataOrderOptions& options);
+
+// How two data are ordered; aggregates pass the same options on to their elements.
+struct DataOrderOptions {
+  // Null array handles: with it a null array sorts after any other and counts are not compared
+  // first; without it a null array is an empty one.
+  bool nullFirst = false;
+  int32_t variantOption = 0;  // for the comparisons registered for variants and collections
+  // Aggregates without handles, and refnums, compare their bytes; arrays of elements without
+  // handles compare their elements in one block.
+  int32_t bytewise = 0;
+  int32_t rawNumbers = 0;  // numbers compare their bytes rather than their values
+  // Compares each element of an aggregate, so that a registered comparison applies at any depth.
+  ElementComparison compareElement = nullptr;
+};
+
 class TDImp : public TDRefCountedHashedObj {
  public:
   ~TDImp() override;
@@ -147,6 +180,11 @@ class TDImp : public TDRefCountedHashedObj {
   // Depth and expanded count from the elements' own (1 and 1 for a descriptor without any).
   virtual void ComputeNesting(uint32_t* depth, uint32_t* count) const;
 
+  // --- ordering of data ------------------------------------------------------------------------
+  // The order of two data (neither null) of this kind. The base knows none, but for the refnum's
+  // cookie while refnums have no family of their own.
+  virtual DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const;
+
   // --- non-virtual members ---------------------------------------------------------------------
   // The interned equal object (made and inserted when absent); null when memory runs out.
   TDImpPtr CheckIn() const;
@@ -181,6 +219,9 @@ class TDImp : public TDRefCountedHashedObj {
  protected:
   TDImp() noexcept = default;
   TDImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink) noexcept;
+
+  // The order of the two data's bytes, DataSizeCore of them.
+  DataOrder OrderBytes(const void* a, const void* b) const;
 
  private:
   TDNameImpPtr name_;
