@@ -1927,9 +1927,7 @@ int32_t ReadElements(KoDataReader* reader, const ArrayLayout& layout, uint8_t* f
     reader->SetError(kStatusImplausibleData);
     return reader->GetError();
   }
-  int32_t status = reader->GetError();
-  layout.elt->ReadData(reader, first, static_cast<int32_t>(count), &status);
-  reader->SetError(status);
+  layout.elt->ReadData(reader, first, static_cast<int32_t>(count), nullptr);
   return reader->GetError();
 }
 
@@ -1974,9 +1972,7 @@ int32_t ReadIntoPreallocated(KoDataReader* reader, const TDArrayImp& type, const
       if (into != nullptr) *into = unpacked[static_cast<size_t>(linear)];
       continue;
     }
-    int32_t status = reader->GetError();
-    layout.elt->ReadData(reader, into, 1, &status);
-    reader->SetError(status);
+    layout.elt->ReadData(reader, into, 1, nullptr);
   }
   return reader->GetError();
 }
@@ -2016,8 +2012,7 @@ uint32_t TDArrayImp::FlatDataSize(KoDataWriter* writer, const void* data) const 
   return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
 }
 
-int32_t TDArrayImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDArrayImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   if (!IsWellFormed()) {
     ReportMalformed();
     writer->SetError(kStatusNullHandle);
@@ -2042,17 +2037,12 @@ int32_t TDArrayImp::WriteData(KoDataWriter* writer, const void* data, int32_t co
     if (PacksBooleans(*layout.elt, writer->GetVersion())) {
       WritePackedBooleans(writer, layout.Element(*h, 0), nDims, DimsOf(h), elements);
     } else if (elements != 0) {
-      int32_t elementStatus = kStatusNoError;
-      layout.elt->WriteData(writer, layout.Element(*h, 0), static_cast<int32_t>(elements), &elementStatus);
-      writer->SetError(elementStatus);
+      layout.elt->WriteData(writer, layout.Element(*h, 0), static_cast<int32_t>(elements), nullptr);
     }
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDArrayImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDArrayImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   if (!IsWellFormed()) {
     ReportMalformed();
     reader->SetError(kStatusNullHandle);
@@ -2116,8 +2106,6 @@ int32_t TDArrayImp::ReadData(KoDataReader* reader, void* data, int32_t count, in
     }
     ReadIntoPreallocated(reader, *this, layout, h, sizes.data(), elements);
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
 }
 
 uint32_t TDSubArrayImp::FlatDataSize(KoDataWriter* writer, const void* data) const {
@@ -2136,8 +2124,7 @@ uint32_t TDSubArrayImp::FlatDataSize(KoDataWriter* writer, const void* data) con
   return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
 }
 
-int32_t TDSubArrayImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDSubArrayImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   if (!IsWellFormed()) {
     ReportMalformed();
     writer->SetError(kStatusNullHandle);
@@ -2158,19 +2145,13 @@ int32_t TDSubArrayImp::WriteData(KoDataWriter* writer, const void* data, int32_t
     for (int32_t d = 0; d < nDims; ++d) writer->WriteI32(static_cast<int32_t>(source.Size(d)));
     WalkRowMajor(source, [&source](int32_t d) { return source.Size(d); }, elements,
                  [&](int64_t, const uint8_t* element) {
-                   int32_t elementStatus = kStatusNoError;
-                   layout.elt->WriteData(writer, element, 1, &elementStatus);
-                   writer->SetError(elementStatus);
+                   layout.elt->WriteData(writer, element, 1, nullptr);
                    return writer->GetError();
                  });
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDSubArrayImp::ReadData(KoDataReader* reader, void*, int32_t, int32_t* status) const {
+void TDSubArrayImp::ReadFlatData(KoDataReader* reader, void*, int32_t) const {
   DebugReport(kDiagnosticModule, __LINE__, 2, "ReadData does not handle subArrays!");
   reader->SetError(kStatusBadArgument);
-  if (status != nullptr) *status = reader->GetError();
-  return 0;
 }

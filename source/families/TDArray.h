@@ -122,8 +122,6 @@ class TDArrayImp final : public TDArrayBaseImp {
   // before allocating, a count whose elements cannot fit in the input left (116), and keeps a
   // bounded or fixed array in its preallocated block, cut to the bounds.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   // By element count first (without nullFirst; with it a null array sorts last), then by the
   // dimension words, then element by element; bytewise, elements without handles as one block.
   DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
@@ -133,6 +131,8 @@ class TDArrayImp final : public TDArrayBaseImp {
   int32_t ResizeToDims(UHandle* h, const int32_t* dims) const;
 
  protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
   const char* KindText() const override { return "array"; }
 };
 
@@ -161,13 +161,13 @@ class TDSubArrayImp final : public TDArrayBaseImp {
   int32_t IsSubArrayOnly() const override { return 1; }
   // Written as the array it views; never read ("ReadData does not handle subArrays!").
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsSubType() const override { return 1; }
   // The records' bytes, not the elements they view (noted as such).
   DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
  protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
   const char* KindText() const override { return "subarray"; }
 };
 

@@ -718,22 +718,20 @@ uint32_t TDRepeatedBlockImp::FlatDataSize(KoDataWriter* writer, const void* data
   return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
 }
 
-int32_t TDRepeatedBlockImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+void TDRepeatedBlockImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   const int32_t values = ElementValues(numBlocks_, count);
   if (!GetElt() || values < 0) {
     writer->SetError(GetElt() ? kStatusBadArgument : kStatusNullHandle);
-    if (status != nullptr) *status = writer->GetError();
-    return 0;
+    return;
   }
-  return GetElt()->WriteData(writer, data, values, status);
+  GetElt()->WriteData(writer, data, values, nullptr);
 }
 
-int32_t TDRepeatedBlockImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+void TDRepeatedBlockImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   const int32_t values = ElementValues(numBlocks_, count);
   if (!GetElt() || values < 0) {
     reader->SetError(GetElt() ? kStatusImplausibleData : kStatusNullHandle);
-    if (status != nullptr) *status = reader->GetError();
-    return 0;
+    return;
   }
-  return GetElt()->ReadData(reader, data, values, status);
+  GetElt()->ReadData(reader, data, values, nullptr);
 }

@@ -197,11 +197,13 @@ class TDRepeatedBlockImp final : public TDBlockContainerImp {
   int32_t ConstructTD(TDDataReader* reader) override;
   // The element's values, one per block.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
 
   uint32_t GetNumBlocks() const noexcept { return numBlocks_; }
   void SetNumBlocks(uint32_t count);
+
+ protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
 
  private:
   // Calls `step(block data)` for each block in order while it returns 0; the first other status.

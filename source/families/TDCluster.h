@@ -40,8 +40,6 @@ class TDClusterImp : public TDMultiContainerImp {
   int32_t ResetToDefaultData(void* data) const override;
   // The elements in order, each in its own flattened form, without the in-memory padding.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const override;
   int32_t IsClust() const override { return 1; }
@@ -76,6 +74,10 @@ class TDClusterImp : public TDMultiContainerImp {
         },
         &visit);
   }
+
+ protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
 
  private:
   using EltOffsetVisit = int32_t (*)(void* context, const TDImp& element, int64_t offset);

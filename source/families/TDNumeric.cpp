@@ -1159,8 +1159,7 @@ uint32_t TDBasicNumericImp::FlatDataSize(KoDataWriter*, const void*) const {
   return static_cast<uint32_t>(size * parts.parts);
 }
 
-int32_t TDBasicNumericImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDBasicNumericImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   const NumericParts parts = PartsOf(GetTypeCode());
   const size_t values = parts.parts * static_cast<size_t>(std::max(count, 0));
   if (values != 0 && data == nullptr) writer->SetError(kStatusBadArgument);
@@ -1171,12 +1170,9 @@ int32_t TDBasicNumericImp::WriteData(KoDataWriter* writer, const void* data, int
   } else if (values != 0) {
     writer->WriteValues(data, parts.partSize, values);
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDBasicNumericImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDBasicNumericImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   const NumericParts parts = PartsOf(GetTypeCode());
   const size_t values = parts.parts * static_cast<size_t>(std::max(count, 0));
   if (parts.partSize == kExtendedBytes) {
@@ -1188,6 +1184,4 @@ int32_t TDBasicNumericImp::ReadData(KoDataReader* reader, void* data, int32_t co
   } else {
     reader->Skip(parts.partSize * values);
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
 }

@@ -78,8 +78,6 @@ class TDBasicNumericImp : public TDNumericImp {
   // Each value in the stream's order; complex values real part first; extended values in the
   // writer's 16-byte form.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsFlatDataFixedSize() const override { return 1; }
   int32_t DataSizeCore(ITargetPlatformAlignment* platform) const override;
   int32_t GetAlignment(ITargetPlatformAlignment* platform) const override;
@@ -137,6 +135,8 @@ class TDBasicNumericImp : public TDNumericImp {
   TDBasicNumericImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink, const TDEnumImpPtr& enumeration,
                     const TDUnitsImpPtr& units) noexcept
       : TDNumericImp(name, typedefLink), enum_(enumeration), units_(units) {}
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
 
   // The code without the enumeration/units modifier.
   int32_t BaseCode() const { return StripTypeCodeModifier(GetTypeCode()); }

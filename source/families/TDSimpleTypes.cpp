@@ -203,8 +203,7 @@ uint32_t TDBooleanImp::FlatDataSize(KoDataWriter* writer, const void*) const {
   return writer != nullptr && writer->GetVersion() < kOneByteBooleanVersion ? 2 : 1;
 }
 
-int32_t TDBooleanImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDBooleanImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   const auto* bytes = static_cast<const uint8_t*>(data);
   if (count > 0 && bytes == nullptr) writer->SetError(kStatusBadArgument);
   if (writer->GetVersion() < kOneByteBooleanVersion) {
@@ -212,12 +211,9 @@ int32_t TDBooleanImp::WriteData(KoDataWriter* writer, const void* data, int32_t 
   } else if (count > 0) {
     writer->WriteBytes(bytes, static_cast<size_t>(count));
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDBooleanImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDBooleanImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   auto* bytes = static_cast<uint8_t*>(data);
   if (reader->GetVersion() < kOneByteBooleanVersion) {
     if (count != 1) DebugReport(kDiagnosticModule, __LINE__, 3, "should not be doing multiple old bools");
@@ -232,16 +228,14 @@ int32_t TDBooleanImp::ReadData(KoDataReader* reader, void* data, int32_t count, 
       reader->Skip(static_cast<size_t>(count));
     }
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
 }
 
-int32_t TDBooleanU16Imp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+void TDBooleanU16Imp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   DebugReport(kDiagnosticModule, __LINE__, 3, "Can't flatten old style boolean.");
-  return TDImp::WriteData(writer, data, count, status);
+  TDImp::WriteFlatData(writer, data, count);
 }
 
-int32_t TDBooleanU16Imp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+void TDBooleanU16Imp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   DebugReport(kDiagnosticModule, __LINE__, 3, "Can't unflatten old style boolean.");
-  return TDImp::ReadData(reader, data, count, status);
+  TDImp::ReadFlatData(reader, data, count);
 }

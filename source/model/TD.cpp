@@ -325,9 +325,22 @@ uint32_t TDImp::FlatDataSize(KoDataWriter* writer, const void*) const {
   return static_cast<uint32_t>(DataSizeCore(nullptr));
 }
 
-// Fixed-size data without a form of its own: the bytes as they are in memory.
 int32_t TDImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
   const size_t start = writer->GetBytesWritten();
+  WriteFlatData(writer, data, count);
+  if (status != nullptr) *status = writer->GetError();
+  return static_cast<int32_t>(writer->GetBytesWritten() - start);
+}
+
+int32_t TDImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  const size_t start = reader->Position();
+  ReadFlatData(reader, data, count);
+  if (status != nullptr) *status = reader->GetError();
+  return static_cast<int32_t>(reader->Position() - start);
+}
+
+// Fixed-size data without a form of its own: the bytes as they are in memory.
+void TDImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   if (count > 0 && writer->GetError() == kStatusNoError) {
     if (HoldsRawPointer(*this)) {
       if (WritesPointerPlaceholder(writer->GetVersion()))
@@ -341,12 +354,9 @@ int32_t TDImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, 
       }
     }
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   if (count > 0) {
     const auto bytes = static_cast<size_t>(DataSizeCore(nullptr)) * static_cast<size_t>(count);
     if (HoldsRawPointer(*this)) {
@@ -358,8 +368,6 @@ int32_t TDImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t
       reader->Skip(bytes);
     }
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
 }
 
 // --- ordering of data ------------------------------------------------------------------------------

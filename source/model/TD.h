@@ -140,8 +140,14 @@ class TDImp : public TDRefCountedHashedObj {
   virtual int32_t ShrinkData(void*, void*, int32_t, const HandleAllocationInterface&) const { return 0; }
   virtual uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const;
   virtual int32_t IsFlatDataFixedSize() const { return 0; }
-  virtual int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const;
-  virtual int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const;
+
+ protected:
+  // The work of ReadData and WriteData, which keep the books around it: `count` values read into
+  // `data` (null: skipped) or written from it, any failure left in the stream.
+  virtual void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const;
+  virtual void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const;
+
+ public:
   virtual int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const;
   virtual bool CopyDataConvertDestOverride(const TDImp*, const void*, void*, int32_t, int32_t&) const {
     return false;
@@ -186,6 +192,11 @@ class TDImp : public TDRefCountedHashedObj {
   virtual DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const;
 
   // --- non-virtual members ---------------------------------------------------------------------
+  // `count` values in this kind's flattened form, read into `data` (null: skipped) or written
+  // from it. *status, when given, gets the stream's error afterwards; the bytes read or written.
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const;
+
   // The interned equal object (made and inserted when absent); null when memory runs out.
   TDImpPtr CheckIn() const;
   // Always a new writable copy; null when memory runs out.
