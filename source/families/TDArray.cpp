@@ -74,10 +74,6 @@ bool Below(const void* data, const void* end) {
 
 int32_t Saturated(int64_t bytes) { return static_cast<int32_t>(std::clamp<int64_t>(bytes, 0, kMaxCount)); }
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 void ReportMalformed() { DebugReport(kDiagnosticModule, __LINE__, 3, "Array type without dimension list or element"); }
 void ReportOverflow() { DebugReport(kDiagnosticModule, __LINE__, 3, "Array number of elements overflowed"); }
 void ReportDamagedBlock() { DebugReport(kDiagnosticModule, __LINE__, 3, "Array block smaller than its dimension sizes"); }

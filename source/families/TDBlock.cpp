@@ -24,10 +24,6 @@ namespace {
 
 constexpr int64_t kMaxDataSize = std::numeric_limits<int32_t>::max();
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 void Report(const uint8_t* prefix, const char* text) {
   (VELLUM_DEBUG(0) << PrefixText(prefix) << text).Process();
 }

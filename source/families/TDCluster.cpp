@@ -27,10 +27,6 @@ namespace {
 
 constexpr int64_t kMaxDataSize = std::numeric_limits<int32_t>::max();
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 int32_t MaxAlignmentOf(ITargetPlatformAlignment* platform) {
   return platform != nullptr ? platform->MaxAlignment() : GetDSAlign();
 }

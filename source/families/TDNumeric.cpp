@@ -101,10 +101,6 @@ bool IsUnitsCode(int32_t code) { return code >= 0x19 && code <= 0x1E; }
 // Codes 1 to 30: the integers, floating and complex kinds with their modifiers.
 bool IsBasicNumericCode(int32_t code) { return static_cast<uint8_t>(code - 1) <= 29; }
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 void ReportConversionRefused(const TDImp* dst, const TDImp& src) {
   (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
       .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))

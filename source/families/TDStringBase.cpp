@@ -55,10 +55,6 @@ int32_t Saturated(size_t bytes) {
 
 bool Below(const void* data, const void* end) { return data != nullptr && std::less<const void*>()(data, end); }
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 void ReportPreallocatedTooSmall() {
   DebugReport(kDiagnosticModule, __LINE__, 3,
               "Preallocated string exists whose type thinks it needs more memory than what is preallocated.");

@@ -30,10 +30,6 @@ std::array<std::atomic<DefaultTypeGetter>, 256>& DefaultGetters() {
   return getters;
 }
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 bool TypedefLinksDiffer(const TDTypedefImp& a, const TDTypedefImp& b, int32_t flags) {
   if (!a.GetVIName().EqualFS(b.GetVIName())) return true;
   return (flags & kCmpFlagIgnoreTimeStamps) == 0 && a.GetTimeStamp() != b.GetTimeStamp();
@@ -548,6 +544,10 @@ void TDImpClearMemory(void* data, const TDImp* type, int32_t clear) {
   if (clear == 0 || data == nullptr || type == nullptr) return;
   const int32_t size = type->DataSizeCore(nullptr);
   if (size > 0) ClearMem(data, static_cast<size_t>(size));
+}
+
+std::string PrefixText(const uint8_t* prefix) {
+  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
 }
 
 void ToDebugStream(DebugStream& stream, const TD& type) {

@@ -257,6 +257,9 @@ void TDImpClearMemory(void* data, const TDImp* type, int32_t clear);
 // Appends `[TD "name"]` to the stream.
 void ToDebugStream(DebugStream& stream, const TD& type);
 
+// The prefix PrintDebugStr puts before each line of a dump, as text; empty for null.
+std::string PrefixText(const uint8_t* prefix);
+
 namespace vellum::detail {
 extern std::atomic<int32_t> gDSAlign;
 }  // namespace vellum::detail
