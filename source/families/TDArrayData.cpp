@@ -49,13 +49,7 @@ void ReportPreallocatedExisting() {
   DebugReport(kDiagnosticModule, __LINE__, 3,
               "Array exists whose type thinks it needs more memory than what is preallocated.");
 }
-void ReportCodes(const TDImp* dst, const TDImp& src) {
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(src.GetTypeCode()))
-      .Process();
-}
+void ReportCodes(const TDImp* dst, const TDImp& src) { ReportConversionCodes(kDiagnosticModule, __LINE__, dst, src); }
 
 // The product of the sizes for a report, whatever it is.
 int64_t RawProduct(int32_t nDims, const int32_t* dims) {

@@ -35,13 +35,7 @@ int32_t Order(int64_t a, int64_t b) {
                                                   std::numeric_limits<int32_t>::max()));
 }
 
-void ReportCodes(const TDImp* dst, const TDImp& src) {
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(src.GetTypeCode()))
-      .Process();
-}
+void ReportCodes(const TDImp* dst, const TDImp& src) { ReportConversionCodes(kDiagnosticModule, __LINE__, dst, src); }
 
 const TDSizedBlockImp* AsSizedBlock(const TDImp* type) {
   return type != nullptr && type->IsSizedBlock() != 0 ? static_cast<const TDSizedBlockImp*>(type) : nullptr;

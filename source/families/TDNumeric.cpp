@@ -102,11 +102,7 @@ bool IsUnitsCode(int32_t code) { return code >= 0x19 && code <= 0x1E; }
 bool IsBasicNumericCode(int32_t code) { return static_cast<uint8_t>(code - 1) <= 29; }
 
 void ReportConversionRefused(const TDImp* dst, const TDImp& src) {
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(src.GetTypeCode()))
-      .Process();
+  ReportConversionCodes(kDiagnosticModule, __LINE__, dst, src);
 }
 
 const TDBasicNumericImp* AsBasicNumeric(const TDImp* type) {

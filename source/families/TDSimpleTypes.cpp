@@ -43,11 +43,7 @@ int32_t CopyBytes(const void* src, void* dst, int32_t size) {
 // MutateBooleanTD.
 int32_t ConvertBoolean(const TDImp& self, const TDImp* dst, const void* src, void* dstData, int32_t size) {
   if (dst != nullptr && dst->GetTypeCode() == self.GetTypeCode()) return CopyBytes(src, dstData, size);
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(self.GetTypeCode()))
-      .Process();
+  ReportConversionCodes(kDiagnosticModule, __LINE__, dst, self);
   return kStatusBadArgument;
 }
 

@@ -320,11 +320,7 @@ TDNameImpPtr MakeNameFromCStr(const uint8_t* name, bool* failed) {
 }
 
 void ReportConvertCodes(const TDImp* dst, const TDImp& src) {
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(src.GetTypeCode()))
-      .Process();
+  ReportConversionCodes(kDiagnosticModule, __LINE__, dst, src);
 }
 
 // --- TDStringBaseImp: identity -------------------------------------------------------------------

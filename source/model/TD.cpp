@@ -398,11 +398,7 @@ int32_t TDImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) c
 
 int32_t TDImp::CopyDataConvertCore(const TDImp* dst, const void*, void*, int32_t) const {
   // A family without conversions refuses rather than report an untouched destination as done.
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(GetTypeCode()))
-      .Process();
+  ReportConversionCodes(kDiagnosticModule, __LINE__, dst, *this);
   return kStatusBadArgument;
 }
 
@@ -548,6 +544,14 @@ void TDImpClearMemory(void* data, const TDImp* type, int32_t clear) {
 
 std::string PrefixText(const uint8_t* prefix) {
   return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
+}
+
+void ReportConversionCodes(const char* module, int32_t line, const TDImp* dst, const TDImp& src) {
+  (DebugStream(module, line, 3) << "CopyDataConvert tcDst=")
+      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
+      .Append(", tcSrc=")
+      .AppendHex32(static_cast<uint32_t>(src.GetTypeCode()))
+      .Process();
 }
 
 void ToDebugStream(DebugStream& stream, const TD& type) {

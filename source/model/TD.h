@@ -260,6 +260,10 @@ void ToDebugStream(DebugStream& stream, const TD& type);
 // The prefix PrintDebugStr puts before each line of a dump, as text; empty for null.
 std::string PrefixText(const uint8_t* prefix);
 
+// Writes "CopyDataConvert tcDst=<code of dst, 0 for null>, tcSrc=<code of src>" at level 3 as
+// `module`'s line `line`: the refusal of a conversion, in the words of the family that refused.
+void ReportConversionCodes(const char* module, int32_t line, const TDImp* dst, const TDImp& src);
+
 namespace vellum::detail {
 extern std::atomic<int32_t> gDSAlign;
 }  // namespace vellum::detail
