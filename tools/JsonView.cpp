@@ -292,6 +292,31 @@ void JsonToComplex(const TD& type, const JsonValue& value, void* data, size_t pa
   Inside("1", [&] { read(value[1], Bytes(data) + partSize); });
 }
 
+// One Float part of `bytes` bytes (4, 8 or the 10-byte extended form).
+JsonValue FloatPartToJson(uint8_t bytes, const void* data) {
+  if (bytes == sizeof(float)) return FloatToJson(Load<float>(data));
+  if (bytes == sizeof(double)) return DoubleToJson(Load<double>(data));
+  return ExtendedToJson(data);
+}
+
+void JsonToFloatPart(const TD& type, uint8_t bytes, const JsonValue& value, void* data) {
+  if (bytes == sizeof(float)) return Store(data, JsonToFloat(type, value));
+  if (bytes == sizeof(double)) return Store(data, JsonToDouble(type, value));
+  JsonToExtended(type, value, data);
+}
+
+// Calls `visit` with a zero of the C integer type of `form` and `bytes` (1, 2, 4 or 8).
+template <class Visit>
+decltype(auto) WithIntegerType(ValueForm form, uint8_t bytes, Visit&& visit) {
+  const bool isSigned = form == ValueForm::SignedInteger;
+  switch (bytes) {
+    case 1: return isSigned ? visit(int8_t{}) : visit(uint8_t{});
+    case 2: return isSigned ? visit(int16_t{}) : visit(uint16_t{});
+    case 4: return isSigned ? visit(int32_t{}) : visit(uint32_t{});
+    default: return isSigned ? visit(int64_t{}) : visit(uint64_t{});
+  }
+}
+
 // --- strings and paths -------------------------------------------------------------------------
 
 int32_t StringBound(const TD& type) {
@@ -651,70 +676,29 @@ std::string JsonViewRefusal(const TDR& type) {
   if (!type) return "the null type has no values";
   const TypeCodeInfo* kind = KindOf(type);
   if (kind == nullptr) return NoView(type);
-  switch (kind->code) {
-    case TypeCode::Array:
+  switch (kind->form) {
+    case ValueForm::Array:
       return JsonViewRefusal(TDRArray(type.GetImpPtr(), 1).GetEltTD());
-    case TypeCode::RepeatedBlock:
+    case ValueForm::RepeatedBlock:
       return JsonViewRefusal(TDRRepeatedBlock(type.GetImpPtr(), 1).GetEltTD());
-    case TypeCode::Cluster: {
+    case ValueForm::Cluster: {
       const TDRCluster cluster(type.GetImpPtr(), 1);
       for (int32_t i = 0; i < cluster.GetNumElts(); ++i) {
         if (std::string refusal = JsonViewRefusal(cluster.GetEltTD(i)); !refusal.empty()) return refusal;
       }
       return std::string();
     }
-    case TypeCode::Void:
-    case TypeCode::Int8:
-    case TypeCode::Int16:
-    case TypeCode::Int32:
-    case TypeCode::Int64:
-    case TypeCode::UInt8:
-    case TypeCode::UInt16:
-    case TypeCode::UInt32:
-    case TypeCode::UInt64:
-    case TypeCode::Float32:
-    case TypeCode::Float64:
-    case TypeCode::FloatExt:
-    case TypeCode::Complex64:
-    case TypeCode::Complex128:
-    case TypeCode::ComplexExt:
-    case TypeCode::EnumUInt8:
-    case TypeCode::EnumUInt16:
-    case TypeCode::EnumUInt32:
-    case TypeCode::Float32Units:
-    case TypeCode::Float64Units:
-    case TypeCode::FloatExtUnits:
-    case TypeCode::Complex64Units:
-    case TypeCode::Complex128Units:
-    case TypeCode::ComplexExtUnits:
-    case TypeCode::Boolean:
-    case TypeCode::String:
-    case TypeCode::Path:
-    case TypeCode::Pict:
-    case TypeCode::CStr:
-    case TypeCode::PStr:
-    case TypeCode::Tag:
-    case TypeCode::ArrayDataPtr:
-    case TypeCode::Block:
-    case TypeCode::TypeBlock:
-    case TypeCode::VoidBlock:
-    case TypeCode::AlignedBlock:
-    case TypeCode::AlignmentMarker:
-    case TypeCode::Ptr:
-    case TypeCode::PtrTo:
+    case ValueForm::Nothing:
+    case ValueForm::SignedInteger:
+    case ValueForm::UnsignedInteger:
+    case ValueForm::Float:
+    case ValueForm::Complex:
+    case ValueForm::Boolean:
+    case ValueForm::StringHandle:
+    case ValueForm::Path:
+    case ValueForm::ByteBlock:
       return std::string();
-    case TypeCode::BooleanU16:
-    case TypeCode::SubString:
-    case TypeCode::SubArray:
-    case TypeCode::KoVariant:
-    case TypeCode::MeasureData:
-    case TypeCode::ComplexFixedPoint:
-    case TypeCode::FixedPoint:
-    case TypeCode::Refnum:
-    case TypeCode::SetCollection:
-    case TypeCode::MapCollection:
-    case TypeCode::Function:
-    case TypeCode::PolyVI:
+    case ValueForm::NoGenericView:
       return NoView(type);
   }
   return NoView(type);
@@ -723,63 +707,23 @@ std::string JsonViewRefusal(const TDR& type) {
 JsonValue DataToJson(const TDR& type, const void* data, bool named) {
   const TypeCodeInfo* kind = KindOf(type);
   if (kind == nullptr) throw JsonViewError(NoView(type));
-  switch (kind->code) {
-    case TypeCode::Int8: return IntegerToJson<int8_t>(data);
-    case TypeCode::Int16: return IntegerToJson<int16_t>(data);
-    case TypeCode::Int32: return IntegerToJson<int32_t>(data);
-    case TypeCode::Int64: return IntegerToJson<int64_t>(data);
-    case TypeCode::UInt8:
-    case TypeCode::EnumUInt8: return IntegerToJson<uint8_t>(data);
-    case TypeCode::UInt16:
-    case TypeCode::EnumUInt16: return IntegerToJson<uint16_t>(data);
-    case TypeCode::UInt32:
-    case TypeCode::EnumUInt32: return IntegerToJson<uint32_t>(data);
-    case TypeCode::UInt64: return IntegerToJson<uint64_t>(data);
-    case TypeCode::Float32:
-    case TypeCode::Float32Units: return FloatToJson(Load<float>(data));
-    case TypeCode::Float64:
-    case TypeCode::Float64Units: return DoubleToJson(Load<double>(data));
-    case TypeCode::FloatExt:
-    case TypeCode::FloatExtUnits: return ExtendedToJson(data);
-    case TypeCode::Complex64:
-    case TypeCode::Complex64Units:
-      return ComplexToJson(data, sizeof(float), [](const uint8_t* part) { return FloatToJson(Load<float>(part)); });
-    case TypeCode::Complex128:
-    case TypeCode::Complex128Units:
-      return ComplexToJson(data, sizeof(double), [](const uint8_t* part) { return DoubleToJson(Load<double>(part)); });
-    case TypeCode::ComplexExt:
-    case TypeCode::ComplexExtUnits: return ComplexToJson(data, 10, [](const uint8_t* part) { return ExtendedToJson(part); });
-    case TypeCode::Boolean: return JsonValue(Load<uint8_t>(data) != 0);
-    case TypeCode::String:
-    case TypeCode::Pict:
-    case TypeCode::Tag: return StringToJson(data);
-    case TypeCode::Path: return PathToJson(data);
-    case TypeCode::Array: return ArrayToJson(type, data, named);
-    case TypeCode::Cluster: return ClusterToJson(type, data, named);
-    case TypeCode::RepeatedBlock: return RepeatedToJson(type, data, named);
-    case TypeCode::Block:
-    case TypeCode::TypeBlock:
-    case TypeCode::VoidBlock:
-    case TypeCode::AlignedBlock: return HexObject(data, static_cast<size_t>(std::max(type.DataSize(), 0)));
-    case TypeCode::Void:
-    case TypeCode::AlignmentMarker:
-    case TypeCode::Ptr:
-    case TypeCode::PtrTo:
-    case TypeCode::CStr:
-    case TypeCode::PStr:
-    case TypeCode::ArrayDataPtr: return JsonValue(nullptr);
-    case TypeCode::BooleanU16:
-    case TypeCode::SubString:
-    case TypeCode::SubArray:
-    case TypeCode::KoVariant:
-    case TypeCode::MeasureData:
-    case TypeCode::ComplexFixedPoint:
-    case TypeCode::FixedPoint:
-    case TypeCode::Refnum:
-    case TypeCode::SetCollection:
-    case TypeCode::MapCollection:
-    case TypeCode::Function:
-    case TypeCode::PolyVI: break;
+  const uint8_t bytes = kind->partBytes;
+  switch (kind->form) {
+    case ValueForm::SignedInteger:
+    case ValueForm::UnsignedInteger:
+      return WithIntegerType(kind->form, bytes, [&](auto zero) { return IntegerToJson<decltype(zero)>(data); });
+    case ValueForm::Float: return FloatPartToJson(bytes, data);
+    case ValueForm::Complex:
+      return ComplexToJson(data, bytes, [bytes](const uint8_t* part) { return FloatPartToJson(bytes, part); });
+    case ValueForm::Boolean: return JsonValue(Load<uint8_t>(data) != 0);
+    case ValueForm::StringHandle: return StringToJson(data);
+    case ValueForm::Path: return PathToJson(data);
+    case ValueForm::Array: return ArrayToJson(type, data, named);
+    case ValueForm::Cluster: return ClusterToJson(type, data, named);
+    case ValueForm::RepeatedBlock: return RepeatedToJson(type, data, named);
+    case ValueForm::ByteBlock: return HexObject(data, static_cast<size_t>(std::max(type.DataSize(), 0)));
+    case ValueForm::Nothing: return JsonValue(nullptr);
+    case ValueForm::NoGenericView: break;
   }
   throw JsonViewError(NoView(type));
 }
@@ -787,71 +731,28 @@ JsonValue DataToJson(const TDR& type, const void* data, bool named) {
 void JsonToData(const TDR& type, const JsonValue& value, void* data) {
   const TypeCodeInfo* kind = KindOf(type);
   if (kind == nullptr) throw JsonViewError(NoView(type));
-  switch (kind->code) {
-    case TypeCode::Int8: return JsonToInteger<int8_t>(type, value, data);
-    case TypeCode::Int16: return JsonToInteger<int16_t>(type, value, data);
-    case TypeCode::Int32: return JsonToInteger<int32_t>(type, value, data);
-    case TypeCode::Int64: return JsonToInteger<int64_t>(type, value, data);
-    case TypeCode::UInt8:
-    case TypeCode::EnumUInt8: return JsonToInteger<uint8_t>(type, value, data);
-    case TypeCode::UInt16:
-    case TypeCode::EnumUInt16: return JsonToInteger<uint16_t>(type, value, data);
-    case TypeCode::UInt32:
-    case TypeCode::EnumUInt32: return JsonToInteger<uint32_t>(type, value, data);
-    case TypeCode::UInt64: return JsonToInteger<uint64_t>(type, value, data);
-    case TypeCode::Float32:
-    case TypeCode::Float32Units: return Store(data, JsonToFloat(type, value));
-    case TypeCode::Float64:
-    case TypeCode::Float64Units: return Store(data, JsonToDouble(type, value));
-    case TypeCode::FloatExt:
-    case TypeCode::FloatExtUnits: return JsonToExtended(type, value, data);
-    case TypeCode::Complex64:
-    case TypeCode::Complex64Units:
-      return JsonToComplex(type, value, data, sizeof(float),
-                           [&](const JsonValue& part, uint8_t* at) { Store(at, JsonToFloat(type, part)); });
-    case TypeCode::Complex128:
-    case TypeCode::Complex128Units:
-      return JsonToComplex(type, value, data, sizeof(double),
-                           [&](const JsonValue& part, uint8_t* at) { Store(at, JsonToDouble(type, part)); });
-    case TypeCode::ComplexExt:
-    case TypeCode::ComplexExtUnits:
-      return JsonToComplex(type, value, data, 10,
-                           [&](const JsonValue& part, uint8_t* at) { JsonToExtended(type, part, at); });
-    case TypeCode::Boolean:
+  const uint8_t bytes = kind->partBytes;
+  switch (kind->form) {
+    case ValueForm::SignedInteger:
+    case ValueForm::UnsignedInteger:
+      return WithIntegerType(kind->form, bytes, [&](auto zero) { JsonToInteger<decltype(zero)>(type, value, data); });
+    case ValueForm::Float: return JsonToFloatPart(type, bytes, value, data);
+    case ValueForm::Complex:
+      return JsonToComplex(type, value, data, bytes,
+                           [&](const JsonValue& part, uint8_t* at) { JsonToFloatPart(type, bytes, part, at); });
+    case ValueForm::Boolean:
       if (!value.is_boolean()) Expected("true or false", type, value);
       return Store<uint8_t>(data, value.get<bool>() ? 1 : 0);
-    case TypeCode::String:
-    case TypeCode::Pict:
-    case TypeCode::Tag: return JsonToString(type, value, data);
-    case TypeCode::Path: return JsonToPath(type, value, data);
-    case TypeCode::Array: return JsonToArray(type, value, data);
-    case TypeCode::Cluster: return JsonToCluster(type, value, data);
-    case TypeCode::RepeatedBlock: return JsonToRepeated(type, value, data);
-    case TypeCode::Block:
-    case TypeCode::TypeBlock:
-    case TypeCode::VoidBlock:
-    case TypeCode::AlignedBlock: return JsonToBlock(type, value, data);
-    case TypeCode::Void:
-    case TypeCode::AlignmentMarker:
-    case TypeCode::Ptr:
-    case TypeCode::PtrTo:
-    case TypeCode::CStr:
-    case TypeCode::PStr:
-    case TypeCode::ArrayDataPtr:
+    case ValueForm::StringHandle: return JsonToString(type, value, data);
+    case ValueForm::Path: return JsonToPath(type, value, data);
+    case ValueForm::Array: return JsonToArray(type, value, data);
+    case ValueForm::Cluster: return JsonToCluster(type, value, data);
+    case ValueForm::RepeatedBlock: return JsonToRepeated(type, value, data);
+    case ValueForm::ByteBlock: return JsonToBlock(type, value, data);
+    case ValueForm::Nothing:
       if (!value.is_null()) Expected("null", type, value);
       return;
-    case TypeCode::BooleanU16:
-    case TypeCode::SubString:
-    case TypeCode::SubArray:
-    case TypeCode::KoVariant:
-    case TypeCode::MeasureData:
-    case TypeCode::ComplexFixedPoint:
-    case TypeCode::FixedPoint:
-    case TypeCode::Refnum:
-    case TypeCode::SetCollection:
-    case TypeCode::MapCollection:
-    case TypeCode::Function:
-    case TypeCode::PolyVI: break;
+    case ValueForm::NoGenericView: break;
   }
   throw JsonViewError(NoView(type));
 }
@@ -871,23 +772,23 @@ uint64_t BlockBytes(const TDR& type, uint32_t depth) {
   if (kind == nullptr || depth > kMaxTypeNestingDepth) return 0;
   // A block's bookkeeping, rounded up.
   constexpr uint64_t kBlockOverhead = 64;
-  const TypeCode code = kind->code;
-  if (code == TypeCode::String || code == TypeCode::Pict || code == TypeCode::Tag) {
+  const ValueForm form = kind->form;
+  if (form == ValueForm::StringHandle) {
     const int32_t bound = StringBound(type);
     return vellum::bound::IsVariable(bound) ? 0 : kBlockOverhead + static_cast<uint64_t>(vellum::bound::Length(bound));
   }
-  if (code == TypeCode::Path) return kBlockOverhead;
-  if (code == TypeCode::Cluster) {
+  if (form == ValueForm::Path) return kBlockOverhead;
+  if (form == ValueForm::Cluster) {
     const TDRCluster cluster(type.GetImpPtr(), 1);
     uint64_t total = 0;
     for (int32_t i = 0; i < cluster.GetNumElts(); ++i) total = SaturatingAdd(total, BlockBytes(cluster.GetEltTD(i), depth + 1));
     return total;
   }
-  if (code == TypeCode::RepeatedBlock) {
+  if (form == ValueForm::RepeatedBlock) {
     const TDRRepeatedBlock repeated(type.GetImpPtr(), 1);
     return SaturatingMultiply(repeated.GetNumBlocks(), BlockBytes(repeated.GetEltTD(), depth + 1));
   }
-  if (code != TypeCode::Array) return 0;
+  if (form != ValueForm::Array) return 0;
   const TDRArray array(type.GetImpPtr(), 1);
   const TDR element = array.GetEltTD();
   const uint64_t header = kBlockOverhead + 4 * static_cast<uint64_t>(std::max(array.GetNumDims(), 0));

@@ -54,11 +54,7 @@ int32_t TDAlignmentMarkerImp::CopyData(const void* src, void* dst, int32_t, cons
 
 int32_t TDAlignmentMarkerImp::CopyDataConvertCore(const TDImp* dst, const void*, void*, int32_t) const {
   if (dst != nullptr && dst->IsAlignmentMarker() != 0) return kStatusNoError;
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(GetTypeCode()))
-      .Process();
+  ReportConversionCodes(kDiagnosticModule, __LINE__, dst, *this);
   return kStatusBadArgument;
 }
 

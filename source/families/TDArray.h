@@ -122,14 +122,17 @@ class TDArrayImp final : public TDArrayBaseImp {
   // before allocating, a count whose elements cannot fit in the input left (116), and keeps a
   // bounded or fixed array in its preallocated block, cut to the bounds.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
+  // By element count first (without nullFirst; with it a null array sorts last), then by the
+  // dimension words, then element by element; bytewise, elements without handles as one block.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
   // Resizes the block at *h for the dimension words `dims` and writes them: a null *h stays null
   // when every word is 0, and a count of 0 with a nonzero word keeps a block of words only.
   int32_t ResizeToDims(UHandle* h, const int32_t* dims) const;
 
  protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
   const char* KindText() const override { return "array"; }
 };
 
@@ -158,11 +161,13 @@ class TDSubArrayImp final : public TDArrayBaseImp {
   int32_t IsSubArrayOnly() const override { return 1; }
   // Written as the array it views; never read ("ReadData does not handle subArrays!").
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsSubType() const override { return 1; }
+  // The records' bytes, not the elements they view (noted as such).
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
  protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
   const char* KindText() const override { return "subarray"; }
 };
 
@@ -180,11 +185,6 @@ class TDArrayDataPtrImp final : public TDArrayBaseImp {
  protected:
   const char* KindText() const override { return "array data pointer"; }
 };
-
-// The order of two blocks of packed Booleans of `rows` rows of `rowLength` elements (the layout
-// of BooleanU16 arrays): at the first differing element, 1 when a's is true, else -1; 0 when all
-// are equal.
-int32_t ComparePackedBooleans(const uint8_t* a, const uint8_t* b, int64_t rows, int64_t rowLength);
 
 // The array side of `type`; null when it is not an array kind.
 const TDArrayBaseImp* AsArrayBase(const TDImp* type);

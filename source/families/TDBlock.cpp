@@ -24,10 +24,6 @@ namespace {
 
 constexpr int64_t kMaxDataSize = std::numeric_limits<int32_t>::max();
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 void Report(const uint8_t* prefix, const char* text) {
   (VELLUM_DEBUG(0) << PrefixText(prefix) << text).Process();
 }
@@ -39,13 +35,7 @@ int32_t Order(int64_t a, int64_t b) {
                                                   std::numeric_limits<int32_t>::max()));
 }
 
-void ReportCodes(const TDImp* dst, const TDImp& src) {
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(src.GetTypeCode()))
-      .Process();
-}
+void ReportCodes(const TDImp* dst, const TDImp& src) { ReportConversionCodes(kDiagnosticModule, __LINE__, dst, src); }
 
 const TDSizedBlockImp* AsSizedBlock(const TDImp* type) {
   return type != nullptr && type->IsSizedBlock() != 0 ? static_cast<const TDSizedBlockImp*>(type) : nullptr;
@@ -81,6 +71,7 @@ const bool gAnnounced = [] {
 }();
 
 uint8_t* At(void* data, int64_t offset) { return static_cast<uint8_t*>(data) + offset; }
+const uint8_t* At(const void* data, int64_t offset) { return static_cast<const uint8_t*>(data) + offset; }
 
 }  // namespace
 
@@ -504,6 +495,20 @@ int32_t TDRepeatedBlockImp::CompareForSorting(const TDImp* other) const {
   return Order(numBlocks_, that->numBlocks_);
 }
 
+DataOrder TDRepeatedBlockImp::OrderData(const void* a, const void* b, const DataOrderOptions& options) const {
+  if (options.bytewise != 0 && DataShapeOf(1) == kDataShapePlain) return OrderBytes(a, b);
+  const TDImp* element = GetElt().get();
+  if (element == nullptr) return {};
+  const int64_t size = std::max(element->DataSizeCore(nullptr), 0);
+  // Copies of nothing are all alike, however many the count says there are.
+  if (size == 0) return {};
+  for (uint32_t k = 0; k < numBlocks_; ++k) {
+    const int32_t order = options.compareElement(*element, At(a, size * k), At(b, size * k), options);
+    if (order != 0) return {order};
+  }
+  return {};
+}
+
 void TDRepeatedBlockImp::PrintDebugStr(const uint8_t* prefix) const {
   Report(prefix, "type = repeated block");
   (VELLUM_DEBUG(0) << PrefixText(prefix) << "number of blocks = " << numBlocks_).Process();
@@ -703,22 +708,20 @@ uint32_t TDRepeatedBlockImp::FlatDataSize(KoDataWriter* writer, const void* data
   return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
 }
 
-int32_t TDRepeatedBlockImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+void TDRepeatedBlockImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   const int32_t values = ElementValues(numBlocks_, count);
   if (!GetElt() || values < 0) {
     writer->SetError(GetElt() ? kStatusBadArgument : kStatusNullHandle);
-    if (status != nullptr) *status = writer->GetError();
-    return 0;
+    return;
   }
-  return GetElt()->WriteData(writer, data, values, status);
+  GetElt()->WriteData(writer, data, values, nullptr);
 }
 
-int32_t TDRepeatedBlockImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+void TDRepeatedBlockImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   const int32_t values = ElementValues(numBlocks_, count);
   if (!GetElt() || values < 0) {
     reader->SetError(GetElt() ? kStatusImplausibleData : kStatusNullHandle);
-    if (status != nullptr) *status = reader->GetError();
-    return 0;
+    return;
   }
-  return GetElt()->ReadData(reader, data, values, status);
+  GetElt()->ReadData(reader, data, values, nullptr);
 }

@@ -25,6 +25,8 @@ class TDSizedBlockImp : public TDImp {
   int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const override;
   int32_t CompareForSorting(const TDImp* other) const override;
   int32_t IsSizedBlock() const override { return 1; }
+  // The blocks' bytes.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions&) const override { return OrderBytes(a, b); }
   // The block size.
   int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
   int32_t ConstructTD(TDDataReader* reader) override;
@@ -101,6 +103,8 @@ class TDStoredAlignmentBlockImp : public TDBlockContainerImp {
   int32_t MemberCheckIn(TDImpPtr& target) const override;
   // By element, then by alignment.
   int32_t CompareForSorting(const TDImp* other) const override;
+  // The blocks' bytes (none for a void block).
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions&) const override { return OrderBytes(a, b); }
 
   uint16_t GetStoredAlignment() const noexcept { return alignment_; }
 
@@ -184,17 +188,22 @@ class TDRepeatedBlockImp final : public TDBlockContainerImp {
   int32_t CompareForSorting(const TDImp* other) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t IsRepeatedBlock() const override { return 1; }
+  // As a cluster of that many copies of the element; bytewise, the bytes when no copy holds
+  // handles.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
   // The number of blocks, then the element's index.
   int32_t FlattenTDPartsForSaving(TDDataWriter* writer) const override;
   int32_t ConstructTD(TDDataReader* reader) override;
   // The element's values, one per block.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
 
   uint32_t GetNumBlocks() const noexcept { return numBlocks_; }
   void SetNumBlocks(uint32_t count);
+
+ protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
 
  private:
   // Calls `step(block data)` for each block in order while it returns 0; the first other status.

@@ -27,10 +27,6 @@ namespace {
 
 constexpr int64_t kMaxDataSize = std::numeric_limits<int32_t>::max();
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 int32_t MaxAlignmentOf(ITargetPlatformAlignment* platform) {
   return platform != nullptr ? platform->MaxAlignment() : GetDSAlign();
 }
@@ -545,6 +541,13 @@ int32_t TDClusterImp::CopyDataConvertCore(const TDImp* dst, const void* src, voi
   return kStatusBadArgument;
 }
 
+DataOrder TDClusterImp::OrderData(const void* a, const void* b, const DataOrderOptions& options) const {
+  if (options.bytewise != 0 && DataShapeOf(1) == kDataShapePlain) return OrderBytes(a, b);
+  return {ForEachElt([&](const TDImp& element, int64_t offset) {
+    return options.compareElement(element, At(a, offset), At(b, offset), options);
+  })};
+}
+
 // --- compatibility ---------------------------------------------------------------------------------
 
 int32_t TDClusterImp::CmpTD(const TDImp* source, int32_t flags, int32_t) const {
@@ -675,8 +678,7 @@ uint32_t TDClusterImp::FlatDataSize(KoDataWriter* writer, const void* data) cons
   return static_cast<uint32_t>(std::min<uint64_t>(size, UINT32_MAX));
 }
 
-int32_t TDClusterImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDClusterImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   if (count > 0 && data == nullptr) writer->SetError(kStatusBadArgument);
   if (HasFlatPlan() && !writer->IsOnlyDeterminingSize()) {
     if (writer->GetError() == kStatusNoError) WriteWithPlan(writer, data, count);
@@ -685,19 +687,14 @@ int32_t TDClusterImp::WriteData(KoDataWriter* writer, const void* data, int32_t 
     for (int32_t v = 0; v < count && writer->GetError() == kStatusNoError; ++v) {
       const uint8_t* value = At(data, stride * v);
       ForEachElt([&](const TDImp& element, int64_t offset) {
-        int32_t elementStatus = kStatusNoError;
-        element.WriteData(writer, At(value, offset), 1, &elementStatus);
-        writer->SetError(elementStatus);
+        element.WriteData(writer, At(value, offset), 1, nullptr);
         return writer->GetError();
       });
     }
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDClusterImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDClusterImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   if (HasFlatPlan() && data != nullptr) {
     if (reader->GetError() == kStatusNoError) ReadWithPlan(reader, data, count);
   } else {
@@ -705,15 +702,11 @@ int32_t TDClusterImp::ReadData(KoDataReader* reader, void* data, int32_t count, 
     for (int32_t v = 0; v < count && reader->GetError() == kStatusNoError; ++v) {
       uint8_t* value = data != nullptr ? At(data, stride * v) : nullptr;
       ForEachElt([&](const TDImp& element, int64_t offset) {
-        int32_t elementStatus = reader->GetError();
-        element.ReadData(reader, value != nullptr ? At(value, offset) : nullptr, 1, &elementStatus);
-        reader->SetError(elementStatus);
+        element.ReadData(reader, value != nullptr ? At(value, offset) : nullptr, 1, nullptr);
         return reader->GetError();
       });
     }
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
 }
 
 // --- the flat plan ---------------------------------------------------------------------------------

@@ -38,8 +38,6 @@ class TDClusterImp : public TDMultiContainerImp {
   int32_t ResetToDefaultData(void* data) const override;
   // The elements in order, each in its own flattened form, without the in-memory padding.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const override;
   int32_t IsClust() const override { return 1; }
@@ -50,6 +48,9 @@ class TDClusterImp : public TDMultiContainerImp {
   int32_t IsErrorCluster(int32_t strict) const override;
   // Some element is generic or semi-generic.
   int32_t IsSemiGeneric() const override;
+  // Element by element in order, the first that differs deciding; bytewise, the bytes when no
+  // element holds handles.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
   // The interned copy also records its layout for the SetDSAlign value in force (2 when memory
   // runs out).
@@ -71,6 +72,10 @@ class TDClusterImp : public TDMultiContainerImp {
         },
         &visit);
   }
+
+ protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
 
  private:
   using EltOffsetVisit = int32_t (*)(void* context, const TDImp& element, int64_t offset);

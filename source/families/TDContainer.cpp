@@ -16,10 +16,6 @@ VELLUM_DIAGNOSTIC_MODULE("TDContainer");
 
 namespace {
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 bool SameElt(const TDImpPtr& a, const TDImpPtr& b) {
   if (a.get() == b.get()) return true;
   if (!a || !b) return false;

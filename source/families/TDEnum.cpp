@@ -14,6 +14,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXStrings.h"
 #include "source/model/CoreTDTable.h"
+#include "source/model/TD.h"
 #include "source/streams/TDDataStreams.h"
 
 VELLUM_DIAGNOSTIC_MODULE("TDEnum");
@@ -21,10 +22,6 @@ VELLUM_DIAGNOSTIC_MODULE("TDEnum");
 namespace {
 
 constexpr size_t kMaxItemLength = 255;
-
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
 
 }  // namespace
 

@@ -101,16 +101,8 @@ bool IsUnitsCode(int32_t code) { return code >= 0x19 && code <= 0x1E; }
 // Codes 1 to 30: the integers, floating and complex kinds with their modifiers.
 bool IsBasicNumericCode(int32_t code) { return static_cast<uint8_t>(code - 1) <= 29; }
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 void ReportConversionRefused(const TDImp* dst, const TDImp& src) {
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(src.GetTypeCode()))
-      .Process();
+  ReportConversionCodes(kDiagnosticModule, __LINE__, dst, src);
 }
 
 const TDBasicNumericImp* AsBasicNumeric(const TDImp* type) {
@@ -916,6 +908,10 @@ TDImpPtr vellum::detail::NewBasicNumeric(TypeCode code, const uint8_t* name, con
   return fresh;
 }
 
+DataOrder TDNumericImp::OrderData(const void* a, const void* b, const DataOrderOptions& options) const {
+  return options.rawNumbers != 0 ? OrderBytes(a, b) : DataOrder{CompareData(a, b)};
+}
+
 int32_t CompareNumericData(const TDImp* type, const void* a, const void* b) {
   const TDNumericImp* numeric = AsNumeric(type);
   return numeric != nullptr ? numeric->CompareData(a, b) : 0;
@@ -1155,8 +1151,7 @@ uint32_t TDBasicNumericImp::FlatDataSize(KoDataWriter*, const void*) const {
   return static_cast<uint32_t>(size * parts.parts);
 }
 
-int32_t TDBasicNumericImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDBasicNumericImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   const NumericParts parts = PartsOf(GetTypeCode());
   const size_t values = parts.parts * static_cast<size_t>(std::max(count, 0));
   if (values != 0 && data == nullptr) writer->SetError(kStatusBadArgument);
@@ -1167,12 +1162,9 @@ int32_t TDBasicNumericImp::WriteData(KoDataWriter* writer, const void* data, int
   } else if (values != 0) {
     writer->WriteValues(data, parts.partSize, values);
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDBasicNumericImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDBasicNumericImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   const NumericParts parts = PartsOf(GetTypeCode());
   const size_t values = parts.parts * static_cast<size_t>(std::max(count, 0));
   if (parts.partSize == kExtendedBytes) {
@@ -1184,6 +1176,4 @@ int32_t TDBasicNumericImp::ReadData(KoDataReader* reader, void* data, int32_t co
   } else {
     reader->Skip(parts.partSize * values);
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
 }

@@ -17,6 +17,8 @@ class TDNumericImp : public TDImp {
   // Complex only into complex of at least the word length; integers by range and step; floating
   // only into floating of at least the word length.
   bool ConversionIsLossless(const TDImp* dst) const override;
+  // By value (CompareData); by the bytes when the options ask for raw numbers.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
   // --- slots 179 to 202 ------------------------------------------------------------------------
   virtual int32_t SupportsUnits() const { return 0; }
@@ -76,8 +78,6 @@ class TDBasicNumericImp : public TDNumericImp {
   // Each value in the stream's order; complex values real part first; extended values in the
   // writer's 16-byte form.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsFlatDataFixedSize() const override { return 1; }
   int32_t DataSizeCore(ITargetPlatformAlignment* platform) const override;
   int32_t GetAlignment(ITargetPlatformAlignment* platform) const override;
@@ -135,6 +135,8 @@ class TDBasicNumericImp : public TDNumericImp {
   TDBasicNumericImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink, const TDEnumImpPtr& enumeration,
                     const TDUnitsImpPtr& units) noexcept
       : TDNumericImp(name, typedefLink), enum_(enumeration), units_(units) {}
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
 
   // The code without the enumeration/units modifier.
   int32_t BaseCode() const { return StripTypeCodeModifier(GetTypeCode()); }

@@ -21,10 +21,6 @@ int32_t PointerSize(ITargetPlatformAlignment* platform) {
   return platform != nullptr ? platform->PointerSize() : kPointerSize;
 }
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 void PrintKind(const TDImp& type, const char* kind, const uint8_t* prefix) {
   DebugReport(kDiagnosticModule, __LINE__, 0, PrefixText(prefix) + "type = " + kind);
   type.TDImp::PrintDebugStr(prefix);

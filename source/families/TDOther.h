@@ -47,6 +47,8 @@ class TDPtrImp final : public TDImp {
   int32_t CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t flags) const override;
   void PrintDebugStr(const uint8_t* prefix) const override;
   int32_t IsPtr() const override { return 1; }
+  // The pointers' bytes.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions&) const override { return OrderBytes(a, b); }
 };
 
 // A pointer whose element describes what it points to. Its value is copied as it is.

@@ -43,12 +43,18 @@ int32_t CopyBytes(const void* src, void* dst, int32_t size) {
 // MutateBooleanTD.
 int32_t ConvertBoolean(const TDImp& self, const TDImp* dst, const void* src, void* dstData, int32_t size) {
   if (dst != nullptr && dst->GetTypeCode() == self.GetTypeCode()) return CopyBytes(src, dstData, size);
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(self.GetTypeCode()))
-      .Process();
+  ReportConversionCodes(kDiagnosticModule, __LINE__, dst, self);
   return kStatusBadArgument;
+}
+
+// Any two values that differ order by `a` alone: a true `a` sorts after `b`, a false one before.
+DataOrder OrderBooleans(const void* a, const void* b, size_t size) {
+  if (BlockCmp(a, b, size) == 0) return {};
+  const auto* bytes = static_cast<const uint8_t*>(a);
+  for (size_t i = 0; i < size; ++i) {
+    if (bytes[i] != 0) return {1};
+  }
+  return {-1};
 }
 
 // Replaces *self by a fresh object of kind `Other` carrying only the name.
@@ -84,6 +90,10 @@ int32_t TDBooleanImp::CopyDataConvertCore(const TDImp* dst, const void* src, voi
   return ConvertBoolean(*this, dst, src, dstData, 1);
 }
 
+DataOrder TDBooleanImp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  return OrderBooleans(a, b, sizeof(uint8_t));
+}
+
 int32_t TDBooleanImp::MutateBooleanTD(TDImpPtr* self, int32_t toOld) {
   return toOld != 0 ? MutateTo<TDBooleanU16Imp>(self) : 0;
 }
@@ -106,6 +116,10 @@ int32_t TDBooleanU16Imp::CopyData(const void* src, void* dst, int32_t, const KoC
 
 int32_t TDBooleanU16Imp::CopyDataConvertCore(const TDImp* dst, const void* src, void* dstData, int32_t) const {
   return ConvertBoolean(*this, dst, src, dstData, 2);
+}
+
+DataOrder TDBooleanU16Imp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  return OrderBooleans(a, b, sizeof(uint16_t));
 }
 
 int32_t TDBooleanU16Imp::MutateBooleanTD(TDImpPtr* self, int32_t toOld) {
@@ -185,8 +199,7 @@ uint32_t TDBooleanImp::FlatDataSize(KoDataWriter* writer, const void*) const {
   return writer != nullptr && writer->GetVersion() < kOneByteBooleanVersion ? 2 : 1;
 }
 
-int32_t TDBooleanImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDBooleanImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   const auto* bytes = static_cast<const uint8_t*>(data);
   if (count > 0 && bytes == nullptr) writer->SetError(kStatusBadArgument);
   if (writer->GetVersion() < kOneByteBooleanVersion) {
@@ -194,12 +207,9 @@ int32_t TDBooleanImp::WriteData(KoDataWriter* writer, const void* data, int32_t 
   } else if (count > 0) {
     writer->WriteBytes(bytes, static_cast<size_t>(count));
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDBooleanImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDBooleanImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   auto* bytes = static_cast<uint8_t*>(data);
   if (reader->GetVersion() < kOneByteBooleanVersion) {
     if (count != 1) DebugReport(kDiagnosticModule, __LINE__, 3, "should not be doing multiple old bools");
@@ -214,16 +224,14 @@ int32_t TDBooleanImp::ReadData(KoDataReader* reader, void* data, int32_t count, 
       reader->Skip(static_cast<size_t>(count));
     }
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
 }
 
-int32_t TDBooleanU16Imp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
+void TDBooleanU16Imp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   DebugReport(kDiagnosticModule, __LINE__, 3, "Can't flatten old style boolean.");
-  return TDImp::WriteData(writer, data, count, status);
+  TDImp::WriteFlatData(writer, data, count);
 }
 
-int32_t TDBooleanU16Imp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+void TDBooleanU16Imp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   DebugReport(kDiagnosticModule, __LINE__, 3, "Can't unflatten old style boolean.");
-  return TDImp::ReadData(reader, data, count, status);
+  TDImp::ReadFlatData(reader, data, count);
 }

@@ -15,6 +15,8 @@ class TDVoidImp final : public TDImp {
   int32_t CopyData(const void*, void*, int32_t, const KoContext*) const override { return 0; }
   void Accept(ITDVisitor* visitor) override;
   int32_t IsVoid() const override { return 1; }
+  // Nothing tells two void data apart.
+  DataOrder OrderData(const void*, const void*, const DataOrderOptions&) const override { return {}; }
 };
 
 // One byte per value.
@@ -32,8 +34,12 @@ class TDBooleanImp final : public TDImp {
   int32_t IsBool() const override { return 1; }
   // One byte as it is in memory; before 0x04502004 a 16-bit word, 0x8000 for true.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
+  // True sorts after false.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
+
+ protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
 };
 
 // The 16-bit Boolean of old data: two bytes per value.
@@ -50,6 +56,10 @@ class TDBooleanU16Imp final : public TDImp {
   void Accept(ITDVisitor* visitor) override;
   int32_t IsBoolU16() const override { return 1; }
   // Has no flattened form: the bytes are copied as they are, after a diagnostic.
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
+  // True (any bit set) sorts after false.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
+
+ protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
 };

@@ -14,6 +14,7 @@
 #include "runtime/DSMemory.h"
 #include "runtime/DebugStream.h"
 #include "runtime/HandleAllocation.h"
+#include "runtime/PXPath.h"
 #include "runtime/PXStrings.h"
 #include "runtime/MoveBytes.h"
 #include "source/model/TDAttributes.h"
@@ -53,10 +54,6 @@ int32_t Saturated(size_t bytes) {
 }
 
 bool Below(const void* data, const void* end) { return data != nullptr && std::less<const void*>()(data, end); }
-
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
 
 void ReportPreallocatedTooSmall() {
   DebugReport(kDiagnosticModule, __LINE__, 3,
@@ -323,11 +320,7 @@ TDNameImpPtr MakeNameFromCStr(const uint8_t* name, bool* failed) {
 }
 
 void ReportConvertCodes(const TDImp* dst, const TDImp& src) {
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(src.GetTypeCode()))
-      .Process();
+  ReportConversionCodes(kDiagnosticModule, __LINE__, dst, src);
 }
 
 // --- TDStringBaseImp: identity -------------------------------------------------------------------
@@ -808,18 +801,14 @@ uint32_t TDStringBaseImp::FlatDataSize(KoDataWriter*, const void* data) const {
   return 4 + static_cast<uint32_t>(h != nullptr ? std::max((*h)->cnt, 0) : 0);
 }
 
-int32_t TDStringBaseImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDStringBaseImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   if (count > 0 && data == nullptr) writer->SetError(kStatusBadArgument);
   const auto* slots = static_cast<const uint8_t*>(data);
   for (int32_t i = 0; i < count && writer->GetError() == kStatusNoError; ++i)
     writer->WriteLStr(LoadHandle(slots + static_cast<size_t>(i) * sizeof(LStrHandle)));
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDStringBaseImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDStringBaseImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   auto* slots = static_cast<uint8_t*>(data);
   for (int32_t i = 0; i < count && reader->GetError() == kStatusNoError; ++i) {
     if (slots == nullptr) {
@@ -831,8 +820,6 @@ int32_t TDStringBaseImp::ReadData(KoDataReader* reader, void* data, int32_t coun
     ReadLStrValue(reader, bound_, &h);
     Store(slot, h);
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
 }
 
 uint32_t TDSubStringImp::FlatDataSize(KoDataWriter*, const void* data) const {
@@ -841,8 +828,7 @@ uint32_t TDSubStringImp::FlatDataSize(KoDataWriter*, const void* data) const {
   return 4 + static_cast<uint32_t>(std::max(rec.length, 0));
 }
 
-int32_t TDSubStringImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDSubStringImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   if (count > 0 && data == nullptr) writer->SetError(kStatusBadArgument);
   const auto* records = static_cast<const uint8_t*>(data);
   for (int32_t i = 0; i < count && writer->GetError() == kStatusNoError; ++i) {
@@ -857,14 +843,10 @@ int32_t TDSubStringImp::WriteData(KoDataWriter* writer, const void* data, int32_
     for (int32_t k = 0; k < rec.length && writer->GetError() == kStatusNoError; ++k)
       writer->WriteU8(rec.dataPtr[static_cast<intptr_t>(k) * rec.stride]);
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDSubStringImp::ReadData(KoDataReader* reader, void*, int32_t, int32_t* status) const {
+void TDSubStringImp::ReadFlatData(KoDataReader*, void*, int32_t) const {
   DebugReport(kDiagnosticModule, __LINE__, 2, "ReadData does not handle subStrings!");
-  if (status != nullptr) *status = reader->GetError();
-  return 0;
 }
 
 uint32_t TDPathImp::FlatDataSize(KoDataWriter*, const void* data) const {
@@ -875,19 +857,15 @@ uint32_t TDPathImp::FlatDataSize(KoDataWriter*, const void* data) const {
   return static_cast<uint32_t>(counter.GetBytesWritten());
 }
 
-int32_t TDPathImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
-  const size_t start = writer->GetBytesWritten();
+void TDPathImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   if (count > 0 && data == nullptr) writer->SetError(kStatusBadArgument);
   const auto* slots = static_cast<const uint8_t*>(data);
   for (int32_t i = 0; i < count && writer->GetError() == kStatusNoError; ++i)
     writer->WritePath(Load<Path>(slots + static_cast<size_t>(i) * sizeof(Path)));
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
 // A path read replaces the one in place, which is disposed of; a failed read leaves no path.
-int32_t TDPathImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDPathImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   auto* slots = static_cast<uint8_t*>(data);
   for (int32_t i = 0; i < count && reader->GetError() == kStatusNoError; ++i) {
     Path read = nullptr;
@@ -901,6 +879,28 @@ int32_t TDPathImp::ReadData(KoDataReader* reader, void* data, int32_t count, int
     FDestroyPath(&old);
     Store(slot, read);
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
+}
+
+// --- ordering of data ------------------------------------------------------------------------------
+
+DataOrder TDStringBaseImp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  return {LHStrCmp(Load<LStrHandle>(a), Load<LStrHandle>(b))};
+}
+
+DataOrder TDSubStringImp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  return {OrderBytes(a, b).order, DataOrderNote::SubtypeRecords};
+}
+
+DataOrder TDPathImp::OrderData(const void* a, const void* b, const DataOrderOptions&) const {
+  const auto first = Load<Path>(a);
+  const auto second = Load<Path>(b);
+  if (first != nullptr && second != nullptr) return {FPathCmpExact(first, second)};
+  Path notAPath = nullptr;
+  if (FNotAPath(&notAPath) != kStatusNoError) {
+    FDestroyPath(&notAPath);
+    return {FPathCmpExact(first, second)};
+  }
+  const int32_t order = FPathCmpExact(first != nullptr ? first : notAPath, second != nullptr ? second : notAPath);
+  FDestroyPath(&notAPath);
+  return {order};
 }

@@ -37,8 +37,6 @@ class TDStringBaseImp : public TDImp {
   // handle for the bound word (the length read for a variable string), truncates or zero-fills
   // to it, and refuses a length that is negative or beyond the input (116) before allocating.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsFlatDataFixedSize() const override { return vellum::bound::IsFixed(bound_) ? 1 : 0; }
   int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const override;
   // Into the same code, or between String and Tag, following the destination's bound word.
@@ -50,6 +48,8 @@ class TDStringBaseImp : public TDImp {
   // By bound word, smaller first.
   int32_t CompareForSorting(const TDImp* other) const override;
   int32_t IsStringBase() const override { return 1; }
+  // The bytes, as LHStrCmp orders them; a null handle is the empty string.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
   // --- members ---------------------------------------------------------------------------------
   int32_t GetBound() const noexcept { return bound_; }
@@ -60,6 +60,8 @@ class TDStringBaseImp : public TDImp {
   TDStringBaseImp() noexcept = default;
   TDStringBaseImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink, int32_t bound) noexcept
       : TDImp(name, typedefLink), bound_(bound) {}
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
 
   // What the dump calls the kind.
   virtual const char* KindText() const = 0;
@@ -108,13 +110,15 @@ class TDSubStringImp final : public TDStringBaseImp {
   int32_t CmpTD(const TDImp* source, int32_t flags, int32_t bitsSoFar) const override;
   // Written as the string it views; never read ("ReadData does not handle subStrings!").
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsString() const override { return 1; }
   int32_t IsSubStringOnly() const override { return 1; }
   int32_t IsSubType() const override { return 1; }
+  // The records' bytes, not the bytes they view (noted as such).
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
  protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
   const char* KindText() const override { return "substring"; }
 };
 
@@ -138,11 +142,13 @@ class TDPathImp final : public TDStringBaseImp {
   int32_t ResetToDefaultData(void* data) const override;
   // The runtime's flattened path; a null path reads and writes as not-a-path.
   uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const override;
-  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const override;
-  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const override;
   int32_t IsPath() const override { return 1; }
+  // FPathCmpExact; a null path orders as not-a-path, which is how it is flattened.
+  DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const override;
 
  protected:
+  void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const override;
+  void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const override;
   const char* KindText() const override { return "path"; }
 };
 

@@ -45,10 +45,6 @@ uint16_t RepairedTagType(uint16_t kind) {
 
 std::atomic<TagComparisonFunc> gComparisonFunc{nullptr};
 
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
-
 uint32_t ContextBits(const KoContext* context) {
   return static_cast<uint32_t>(reinterpret_cast<uintptr_t>(context));
 }

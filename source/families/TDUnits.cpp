@@ -10,6 +10,7 @@
 
 #include "runtime/DebugStream.h"
 #include "source/model/CoreTDTable.h"
+#include "source/model/TD.h"
 #include "source/streams/TDDataStreams.h"
 
 VELLUM_DIAGNOSTIC_MODULE("TDUnits");
@@ -20,10 +21,6 @@ constexpr TDBaseUnits kSmallestPolymorphicKey = -9;
 
 const char* const kBaseUnitText[] = {"radians", "steradians", "seconds",  "meters",  "kilograms",
                                      "amperes", "kelvins",    "moles",    "candelas", "invalid unit"};
-
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
-}
 
 // Sets or removes one entry of `map`; the map is unchanged when the insertion runs out of memory.
 int32_t StoreExponent(TDUnitsImp::Map* map, TDBaseUnits unit, int32_t exponent) {

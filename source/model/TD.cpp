@@ -2,6 +2,7 @@
 // check-out, flags, type compatibility framework, traversal, the debug dump and the short text.
 #include "source/model/TD.h"
 
+#include <algorithm>
 #include <array>
 #include <atomic>
 #include <cstring>
@@ -9,6 +10,7 @@
 #include "runtime/PXNumbers.h"
 #include "runtime/PXStrings.h"
 #include "source/model/CoreTDTable.h"
+#include "runtime/MoveBytes.h"
 #include "source/model/TDAttributes.h"
 #include "source/model/TypeManager.h"
 #include "source/streams/KoCMutate.h"
@@ -26,10 +28,6 @@ namespace {
 std::array<std::atomic<DefaultTypeGetter>, 256>& DefaultGetters() {
   static std::array<std::atomic<DefaultTypeGetter>, 256> getters{};
   return getters;
-}
-
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
 }
 
 bool TypedefLinksDiffer(const TDTypedefImp& a, const TDTypedefImp& b, int32_t flags) {
@@ -323,9 +321,22 @@ uint32_t TDImp::FlatDataSize(KoDataWriter* writer, const void*) const {
   return static_cast<uint32_t>(DataSizeCore(nullptr));
 }
 
-// Fixed-size data without a form of its own: the bytes as they are in memory.
 int32_t TDImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const {
   const size_t start = writer->GetBytesWritten();
+  WriteFlatData(writer, data, count);
+  if (status != nullptr) *status = writer->GetError();
+  return static_cast<int32_t>(writer->GetBytesWritten() - start);
+}
+
+int32_t TDImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
+  const size_t start = reader->Position();
+  ReadFlatData(reader, data, count);
+  if (status != nullptr) *status = reader->GetError();
+  return static_cast<int32_t>(reader->Position() - start);
+}
+
+// Fixed-size data without a form of its own: the bytes as they are in memory.
+void TDImp::WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const {
   if (count > 0 && writer->GetError() == kStatusNoError) {
     if (HoldsRawPointer(*this)) {
       if (WritesPointerPlaceholder(writer->GetVersion()))
@@ -339,12 +350,9 @@ int32_t TDImp::WriteData(KoDataWriter* writer, const void* data, int32_t count, 
       }
     }
   }
-  if (status != nullptr) *status = writer->GetError();
-  return static_cast<int32_t>(writer->GetBytesWritten() - start);
 }
 
-int32_t TDImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const {
-  const size_t start = reader->Position();
+void TDImp::ReadFlatData(KoDataReader* reader, void* data, int32_t count) const {
   if (count > 0) {
     const auto bytes = static_cast<size_t>(DataSizeCore(nullptr)) * static_cast<size_t>(count);
     if (HoldsRawPointer(*this)) {
@@ -356,8 +364,24 @@ int32_t TDImp::ReadData(KoDataReader* reader, void* data, int32_t count, int32_t
       reader->Skip(bytes);
     }
   }
-  if (status != nullptr) *status = reader->GetError();
-  return static_cast<int32_t>(reader->Position() - start);
+}
+
+// --- ordering of data ------------------------------------------------------------------------------
+
+DataOrder TDImp::OrderBytes(const void* a, const void* b) const {
+  return {BlockCmp(a, b, static_cast<size_t>(std::max(DataSizeCore(nullptr), 0)))};
+}
+
+DataOrder TDImp::OrderData(const void* a, const void* b, const DataOrderOptions& options) const {
+  if (GetTypeCode() != static_cast<int16_t>(TypeCode::Refnum)) return {0, DataOrderNote::NoOrder};
+  // A refnum's datum is its cookie, an unsigned number of its size.
+  if (options.bytewise != 0) return OrderBytes(a, b);
+  const auto order = [](auto x, auto y) { return DataOrder{x < y ? -1 : (y < x ? 1 : 0)}; };
+  switch (DataSizeCore(nullptr)) {
+    case sizeof(uint64_t): return order(Load<uint64_t>(a), Load<uint64_t>(b));
+    case sizeof(uint32_t): return order(Load<uint32_t>(a), Load<uint32_t>(b));
+    default: return {0, DataOrderNote::UnsupportedRefnumSize};
+  }
 }
 
 int32_t TDImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) const {
@@ -374,11 +398,7 @@ int32_t TDImp::CopyData(const void* src, void* dst, int32_t, const KoContext*) c
 
 int32_t TDImp::CopyDataConvertCore(const TDImp* dst, const void*, void*, int32_t) const {
   // A family without conversions refuses rather than report an untouched destination as done.
-  (VELLUM_DEBUG(3) << "CopyDataConvert tcDst=")
-      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
-      .Append(", tcSrc=")
-      .AppendHex32(static_cast<uint32_t>(GetTypeCode()))
-      .Process();
+  ReportConversionCodes(kDiagnosticModule, __LINE__, dst, *this);
   return kStatusBadArgument;
 }
 
@@ -522,6 +542,18 @@ void TDImpClearMemory(void* data, const TDImp* type, int32_t clear) {
   if (size > 0) ClearMem(data, static_cast<size_t>(size));
 }
 
+std::string PrefixText(const uint8_t* prefix) {
+  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
+}
+
+void ReportConversionCodes(const char* module, int32_t line, const TDImp* dst, const TDImp& src) {
+  (DebugStream(module, line, 3) << "CopyDataConvert tcDst=")
+      .AppendHex32(static_cast<uint32_t>(dst != nullptr ? dst->GetTypeCode() : 0))
+      .Append(", tcSrc=")
+      .AppendHex32(static_cast<uint32_t>(src.GetTypeCode()))
+      .Process();
+}
+
 void ToDebugStream(DebugStream& stream, const TD& type) {
   stream << "[TD \"";
   stream.AppendPStr(type.GetNamePStr());
@@ -531,14 +563,6 @@ void ToDebugStream(DebugStream& stream, const TD& type) {
 std::atomic<int32_t> vellum::detail::gDSAlign{0};
 
 void SetDSAlign(int32_t alignment) { vellum::detail::gDSAlign.store(alignment, std::memory_order_relaxed); }
-
-
-const TypeCodeInfo* FindTypeCode(int32_t raw) {
-  for (const TypeCodeInfo& info : kTypeCodes) {
-    if (static_cast<int32_t>(info.code) == raw) return &info;
-  }
-  return nullptr;
-}
 
 void RegisterDefaultTypeGetter(int32_t code, DefaultTypeGetter getter) {
   if (code < 0 || code > 255) return;

@@ -39,6 +39,39 @@ constexpr uint32_t kTDIdentityFlagsMask = ~(kTDFlagReadOnly | kTDFlagRecursiveMa
 using TDVisitFn = TDTraverseValue (*)(TDImp* td, void* context, TDImpPtr* replacement);
 using TDShouldRecurseFn = bool (*)(TDImp* td, void* context);
 
+// What a kind's order of two data says besides the order. Ordering reports what it has to say
+// from one module, so a kind hands back a note and the caller writes the message.
+enum class DataOrderNote : uint8_t {
+  None,
+  NoOrder,                // the kind has no order: its data compare equal
+  SubtypeRecords,         // a subtype's records were compared as bytes, not what they view
+  UnsupportedRefnumSize,  // a refnum of neither 4 nor 8 bytes: its data compare equal
+};
+
+struct DataOrder {
+  int32_t order = 0;  // negative, 0 or positive, as a three-way comparison
+  DataOrderNote note = DataOrderNote::None;
+};
+
+struct DataOrderOptions;
+// The whole comparison of one datum of `type`, registered comparisons included; 0 when either
+// datum is null.
+using ElementComparison = int32_t (*)(const TDImp& type, const void* a, const void* b, const DataOrderOptions& options);
+
+// How two data are ordered; aggregates pass the same options on to their elements.
+struct DataOrderOptions {
+  // Null array handles: with it a null array sorts after any other and counts are not compared
+  // first; without it a null array is an empty one.
+  bool nullFirst = false;
+  int32_t variantOption = 0;  // for the comparisons registered for variants and collections
+  // Aggregates without handles, and refnums, compare their bytes; arrays of elements without
+  // handles compare their elements in one block.
+  int32_t bytewise = 0;
+  int32_t rawNumbers = 0;  // numbers compare their bytes rather than their values
+  // Compares each element of an aggregate, so that a registered comparison applies at any depth.
+  ElementComparison compareElement = nullptr;
+};
+
 class TDImp : public TDRefCountedHashedObj {
  public:
   ~TDImp() override;
@@ -76,8 +109,14 @@ class TDImp : public TDRefCountedHashedObj {
   virtual int32_t ShrinkData(void*, void*, int32_t, const HandleAllocationInterface&) const { return 0; }
   virtual uint32_t FlatDataSize(KoDataWriter* writer, const void* data) const;
   virtual int32_t IsFlatDataFixedSize() const { return 0; }
-  virtual int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const;
-  virtual int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const;
+
+ protected:
+  // The work of ReadData and WriteData, which keep the books around it: `count` values read into
+  // `data` (null: skipped) or written from it, any failure left in the stream.
+  virtual void ReadFlatData(KoDataReader* reader, void* data, int32_t count) const;
+  virtual void WriteFlatData(KoDataWriter* writer, const void* data, int32_t count) const;
+
+ public:
   virtual int32_t CopyData(const void* src, void* dst, int32_t flags, const KoContext* context) const;
   virtual bool CopyDataConvertDestOverride(const TDImp*, const void*, void*, int32_t, int32_t&) const {
     return false;
@@ -116,7 +155,17 @@ class TDImp : public TDRefCountedHashedObj {
   // Depth and expanded count from the elements' own (1 and 1 for a descriptor without any).
   virtual void ComputeNesting(uint32_t* depth, uint32_t* count) const;
 
+  // --- ordering of data ------------------------------------------------------------------------
+  // The order of two data (neither null) of this kind. The base knows none, but for the refnum's
+  // cookie while refnums have no family of their own.
+  virtual DataOrder OrderData(const void* a, const void* b, const DataOrderOptions& options) const;
+
   // --- non-virtual members ---------------------------------------------------------------------
+  // `count` values in this kind's flattened form, read into `data` (null: skipped) or written
+  // from it. *status, when given, gets the stream's error afterwards; the bytes read or written.
+  int32_t ReadData(KoDataReader* reader, void* data, int32_t count, int32_t* status) const;
+  int32_t WriteData(KoDataWriter* writer, const void* data, int32_t count, int32_t* status) const;
+
   // The interned equal object (made and inserted when absent); null when memory runs out.
   TDImpPtr CheckIn() const;
   // Always a new writable copy; null when memory runs out.
@@ -151,6 +200,9 @@ class TDImp : public TDRefCountedHashedObj {
   TDImp() noexcept = default;
   TDImp(const TDNameImpPtr& name, const TDTypedefImpPtr& typedefLink) noexcept;
 
+  // The order of the two data's bytes, DataSizeCore of them.
+  DataOrder OrderBytes(const void* a, const void* b) const;
+
  private:
   TDNameImpPtr name_;
   TDTypedefImpPtr typedef_;
@@ -170,6 +222,13 @@ inline TDR TDRFromImp(const TDImpPtr& imp) { return TDR(imp, 1); }
 
 // Zeroes the in-place bytes of one datum of `type` when `clear` is nonzero.
 void TDImpClearMemory(void* data, const TDImp* type, int32_t clear);
+
+// The prefix PrintDebugStr puts before each line of a dump, as text; empty for null.
+std::string PrefixText(const uint8_t* prefix);
+
+// Writes "CopyDataConvert tcDst=<code of dst, 0 for null>, tcSrc=<code of src>" at level 3 as
+// `module`'s line `line`: the refusal of a conversion, in the words of the family that refused.
+void ReportConversionCodes(const char* module, int32_t line, const TDImp* dst, const TDImp& src);
 
 // Writes the record of `type` (and first those of every descriptor it needs) unless the writer's
 // save table holds an equal one, and gives its save-table index.

@@ -9,6 +9,7 @@
 #include "runtime/DebugStream.h"
 #include "runtime/PXStrings.h"
 #include "source/model/CoreTDTable.h"
+#include "source/model/TD.h"
 #include "source/streams/KoCMutate.h"
 #include "source/streams/TDDataStreams.h"
 
@@ -23,10 +24,6 @@ uint32_t HashBytes(const uint8_t* bytes, size_t length) {
     hash = std::rotl(hash + bytes[i], static_cast<int>((i + 1) % 32));
   }
   return hash;
-}
-
-std::string PrefixText(const uint8_t* prefix) {
-  return prefix != nullptr ? std::string(reinterpret_cast<const char*>(prefix)) : std::string();
 }
 
 size_t CStrLength(const uint8_t* cString) {

@@ -20,6 +20,7 @@
 #include "vellum/TDSimpleHandles.h"
 #include "vellum/TDStringHandles.h"
 #include "vellum/TDTagHandles.h"
+#include "vellum/TypeCodes.h"
 
 namespace {
 
@@ -49,86 +50,38 @@ void Write(const TDR& type, std::string& out) {
     return;
   }
   const auto code = static_cast<TypeCode>(type.GetTypeCode());
-  switch (code) {
-    case TypeCode::SubArray:
-    case TypeCode::Array: {
-      const TDRArrayBase array(type.GetImpPtr(), 1);
-      out += code == TypeCode::Array ? '[' : '<';
-      out += std::to_string(array.GetNumDims());
-      out += ',';
-      Write(array.GetEltTD(), out);
-      out += code == TypeCode::Array ? ']' : '>';
-      return;
-    }
-    case TypeCode::Cluster: {
-      const TDRMultiContainer cluster(type.GetImpPtr(), 1);
-      out += '{';
-      for (int32_t i = 0; i < cluster.GetNumElts(); ++i) {
-        if (i != 0) out += ',';
-        Write(cluster.GetEltTD(i), out);
-      }
-      out += '}';
-      return;
-    }
-    case TypeCode::PtrTo:
-      out += '&';
-      Write(TDRSingleContainer(type.GetImpPtr(), 1).GetEltTD(), out);
-      return;
-    case TypeCode::SubString: out += 's'; return;
-    case TypeCode::String: out += 'S'; return;
-    case TypeCode::Path: out += 'P'; return;
-    case TypeCode::Boolean: out += 'B'; return;
-    case TypeCode::BooleanU16: out += 'b'; return;
-    case TypeCode::KoVariant: out += 'V'; return;
-    case TypeCode::Void: out += 'v'; return;
-    case TypeCode::Ptr: out += '*'; return;
-    case TypeCode::FixedPoint: out += "fxp"; return;
-    case TypeCode::Int8: out += "iB"; return;
-    case TypeCode::Int16: out += "iW"; return;
-    case TypeCode::Int32: out += "iL"; return;
-    case TypeCode::Int64: out += "iQ"; return;
-    case TypeCode::UInt8: out += "uB"; return;
-    case TypeCode::UInt16: out += "uW"; return;
-    case TypeCode::UInt32: out += "uL"; return;
-    case TypeCode::UInt64: out += "uQ"; return;
-    case TypeCode::Float32: out += "fS"; return;
-    case TypeCode::Float64: out += "fD"; return;
-    case TypeCode::FloatExt: out += "fX"; return;
-    case TypeCode::Complex64: out += "cS"; return;
-    case TypeCode::Complex128: out += "cD"; return;
-    case TypeCode::ComplexExt: out += "cX"; return;
-    case TypeCode::EnumUInt8: out += "eB"; return;
-    case TypeCode::EnumUInt16: out += "eW"; return;
-    case TypeCode::EnumUInt32: out += "eL"; return;
-    case TypeCode::Float32Units: out += "pfS"; return;
-    case TypeCode::Float64Units: out += "pfD"; return;
-    case TypeCode::FloatExtUnits: out += "pfX"; return;
-    case TypeCode::Complex64Units: out += "pcS"; return;
-    case TypeCode::Complex128Units: out += "pcD"; return;
-    case TypeCode::ComplexExtUnits: out += "pcX"; return;
-    // Kinds without a token of their own. Timestamps, waveforms, digital tables, class
-    // instances and refnums get theirs with the kinds that describe them.
-    case TypeCode::Pict:
-    case TypeCode::CStr:
-    case TypeCode::PStr:
-    case TypeCode::Tag:
-    case TypeCode::ArrayDataPtr:
-    case TypeCode::MeasureData:
-    case TypeCode::ComplexFixedPoint:
-    case TypeCode::Block:
-    case TypeCode::TypeBlock:
-    case TypeCode::VoidBlock:
-    case TypeCode::AlignedBlock:
-    case TypeCode::RepeatedBlock:
-    case TypeCode::AlignmentMarker:
-    case TypeCode::Refnum:
-    case TypeCode::SetCollection:
-    case TypeCode::MapCollection:
-    case TypeCode::Function:
-    case TypeCode::PolyVI:
-      break;
+  if (code == TypeCode::Array || code == TypeCode::SubArray) {
+    const TDRArrayBase array(type.GetImpPtr(), 1);
+    out += code == TypeCode::Array ? '[' : '<';
+    out += std::to_string(array.GetNumDims());
+    out += ',';
+    Write(array.GetEltTD(), out);
+    out += code == TypeCode::Array ? ']' : '>';
+    return;
   }
-  out += '?';
+  if (code == TypeCode::Cluster) {
+    const TDRMultiContainer cluster(type.GetImpPtr(), 1);
+    out += '{';
+    for (int32_t i = 0; i < cluster.GetNumElts(); ++i) {
+      if (i != 0) out += ',';
+      Write(cluster.GetEltTD(i), out);
+    }
+    out += '}';
+    return;
+  }
+  if (code == TypeCode::PtrTo) {
+    out += '&';
+    Write(TDRSingleContainer(type.GetImpPtr(), 1).GetEltTD(), out);
+    return;
+  }
+  // Kinds without a token of their own are written as '?'. Timestamps, waveforms, digital tables,
+  // class instances and refnums get theirs with the kinds that describe them.
+  const TypeCodeInfo* kind = FindTypeCode(static_cast<int32_t>(code));
+  if (kind != nullptr && !kind->notation.empty()) {
+    out += kind->notation;
+  } else {
+    out += '?';
+  }
 }
 
 // ---------------------------------------------------------------------------------------------

@@ -149,6 +149,10 @@ uint32_t GetBranchCompatibleVersion(uint32_t version, uint32_t current) {
   return current + 1;
 }
 
+// The kinds' table carries the version as a number, as exported headers cannot name it.
+static_assert(FindTypeCode(static_cast<int32_t>(TypeCode::AlignmentMarker))->firstVersion == kAlignmentMarkerVersion);
+
 uint32_t FirstVersionWithTypeCode(int32_t code) {
-  return code == static_cast<int32_t>(TypeCode::AlignmentMarker) ? kAlignmentMarkerVersion : 0;
+  const TypeCodeInfo* info = FindTypeCode(code);
+  return info != nullptr ? info->firstVersion : 0;
 }
