@@ -320,7 +320,7 @@ decltype(auto) WithIntegerType(ValueForm form, uint8_t bytes, Visit&& visit) {
 // --- strings and paths -------------------------------------------------------------------------
 
 int32_t StringBound(const TD& type) {
-  const TDRStringBase string(type.GetImpPtr(), 1);
+  const TDRStringBase string = vellum::As<TDRStringBase>(type);
   return string ? string.GetBound() : vellum::bound::kVariable;
 }
 
@@ -491,7 +491,7 @@ ArrayContents ContentsOf(const TDRArray& array, const void* data) {
 }
 
 JsonValue ArrayToJson(const TD& type, const void* data, bool named) {
-  const TDRArray array(type.GetImpPtr(), 1);
+  const TDRArray array = vellum::As<TDRArray>(type);
   const TDR element = array.GetEltTD();
   if (!array || !element) throw JsonViewError("the array type has no element");
   const ArrayContents contents = ContentsOf(array, data);
@@ -541,7 +541,7 @@ std::vector<int32_t> ArrayShape(const TD& type, const JsonValue& value, int32_t 
 }
 
 void JsonToArray(const TD& type, const JsonValue& value, void* data) {
-  const TDRArray array(type.GetImpPtr(), 1);
+  const TDRArray array = vellum::As<TDRArray>(type);
   const TDR element = array.GetEltTD();
   if (!array || !element) throw JsonViewError("the array type has no element");
   const int32_t nDims = array.GetNumDims();
@@ -601,7 +601,7 @@ bool ElementNames(const TDRCluster& cluster, std::vector<std::string>* names) {
 }
 
 JsonValue ClusterToJson(const TD& type, const void* data, bool named) {
-  const TDRCluster cluster(type.GetImpPtr(), 1);
+  const TDRCluster cluster = vellum::As<TDRCluster>(type);
   const int32_t n = cluster.GetNumElts();
   std::vector<std::string> names;
   const bool asObject = named && n > 0 && ElementNames(cluster, &names);
@@ -618,7 +618,7 @@ JsonValue ClusterToJson(const TD& type, const void* data, bool named) {
 }
 
 void JsonToCluster(const TD& type, const JsonValue& value, void* data) {
-  const TDRCluster cluster(type.GetImpPtr(), 1);
+  const TDRCluster cluster = vellum::As<TDRCluster>(type);
   const int32_t n = cluster.GetNumElts();
   const auto convert = [&](int32_t i, const JsonValue& part) {
     JsonToData(cluster.GetEltTD(i), part, Bytes(data) + cluster.GetEltOffset(i));
@@ -646,7 +646,7 @@ void JsonToCluster(const TD& type, const JsonValue& value, void* data) {
 }
 
 JsonValue RepeatedToJson(const TD& type, const void* data, bool named) {
-  const TDRRepeatedBlock repeated(type.GetImpPtr(), 1);
+  const TDRRepeatedBlock repeated = vellum::As<TDRRepeatedBlock>(type);
   const TDR element = repeated.GetEltTD();
   if (!element) throw JsonViewError("the repeated block has no element");
   const int64_t stride = element.DataSize();
@@ -656,7 +656,7 @@ JsonValue RepeatedToJson(const TD& type, const void* data, bool named) {
 }
 
 void JsonToRepeated(const TD& type, const JsonValue& value, void* data) {
-  const TDRRepeatedBlock repeated(type.GetImpPtr(), 1);
+  const TDRRepeatedBlock repeated = vellum::As<TDRRepeatedBlock>(type);
   const TDR element = repeated.GetEltTD();
   if (!element) throw JsonViewError("the repeated block has no element");
   if (!value.is_array()) Expected("an array", type, value);
@@ -678,11 +678,11 @@ std::string JsonViewRefusal(const TDR& type) {
   if (kind == nullptr) return NoView(type);
   switch (kind->form) {
     case ValueForm::Array:
-      return JsonViewRefusal(TDRArray(type.GetImpPtr(), 1).GetEltTD());
+      return JsonViewRefusal(vellum::As<TDRArray>(type).GetEltTD());
     case ValueForm::RepeatedBlock:
-      return JsonViewRefusal(TDRRepeatedBlock(type.GetImpPtr(), 1).GetEltTD());
+      return JsonViewRefusal(vellum::As<TDRRepeatedBlock>(type).GetEltTD());
     case ValueForm::Cluster: {
-      const TDRCluster cluster(type.GetImpPtr(), 1);
+      const TDRCluster cluster = vellum::As<TDRCluster>(type);
       for (int32_t i = 0; i < cluster.GetNumElts(); ++i) {
         if (std::string refusal = JsonViewRefusal(cluster.GetEltTD(i)); !refusal.empty()) return refusal;
       }
@@ -779,17 +779,17 @@ uint64_t BlockBytes(const TDR& type, uint32_t depth) {
   }
   if (form == ValueForm::Path) return kBlockOverhead;
   if (form == ValueForm::Cluster) {
-    const TDRCluster cluster(type.GetImpPtr(), 1);
+    const TDRCluster cluster = vellum::As<TDRCluster>(type);
     uint64_t total = 0;
     for (int32_t i = 0; i < cluster.GetNumElts(); ++i) total = SaturatingAdd(total, BlockBytes(cluster.GetEltTD(i), depth + 1));
     return total;
   }
   if (form == ValueForm::RepeatedBlock) {
-    const TDRRepeatedBlock repeated(type.GetImpPtr(), 1);
+    const TDRRepeatedBlock repeated = vellum::As<TDRRepeatedBlock>(type);
     return SaturatingMultiply(repeated.GetNumBlocks(), BlockBytes(repeated.GetEltTD(), depth + 1));
   }
   if (form != ValueForm::Array) return 0;
-  const TDRArray array(type.GetImpPtr(), 1);
+  const TDRArray array = vellum::As<TDRArray>(type);
   const TDR element = array.GetEltTD();
   const uint64_t header = kBlockOverhead + 4 * static_cast<uint64_t>(std::max(array.GetNumDims(), 0));
   const int32_t word = array.BoundedOrFixed();
