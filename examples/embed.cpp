@@ -22,10 +22,13 @@ int main() {
   // One value of the type: default data now, its handles given back when `value` goes.
   vellum::Value value(type);
   if (value.Status() != 0) return 1;
+  // Data is packed unless the host sets an alignment (SetDSAlign): elements are moved by bytes.
   const int32_t count = 3;
   std::memcpy(type.GetEltPtr(0, value.Data()), &count, sizeof count);
-  auto* label = static_cast<LStrHandle*>(type.GetEltPtr(1, value.Data()));
-  if (StringUtils::ToLStr("three samples", label) != 0) return 1;
+  LStrHandle label = nullptr;
+  std::memcpy(&label, type.GetEltPtr(1, value.Data()), sizeof label);
+  if (StringUtils::ToLStr("three samples", &label) != 0) return 1;
+  std::memcpy(type.GetEltPtr(1, value.Data()), &label, sizeof label);
 
   // Its flattened form: portable big-endian bytes of the running version.
   std::vector<uint8_t> bytes;

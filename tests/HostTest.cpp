@@ -29,9 +29,11 @@ TDRCluster CountAndLabel() {
 vellum::Value Filled(const TDRCluster& type) {
   vellum::Value value(type);
   EXPECT_EQ(value.Status(), kStatusNoError);
-  const int32_t count = 3;
-  std::memcpy(type.GetEltPtr(0, value.Data()), &count, sizeof count);
-  EXPECT_EQ(StringUtils::ToLStr("abc", static_cast<LStrHandle*>(type.GetEltPtr(1, value.Data()))), kStatusNoError);
+  // Packed data holds its elements unaligned: moved in and out by bytes.
+  Store(type.GetEltPtr(0, value.Data()), int32_t{3});
+  auto label = Load<LStrHandle>(type.GetEltPtr(1, value.Data()));
+  EXPECT_EQ(StringUtils::ToLStr("abc", &label), kStatusNoError);
+  Store(type.GetEltPtr(1, value.Data()), label);
   return value;
 }
 
