@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "support/TestSupport.h"
+#include "support/TypeStringRecords.h"
 #include "support/TypeSystemFixture.h"
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
@@ -20,13 +21,12 @@
 
 namespace {
 
-using Bytes = std::vector<uint8_t>;
+using records::Bytes;
 using Items = std::vector<std::string>;
 
-constexpr uint32_t kVersion = 0x22308000;
+using records::kVersion;
 constexpr uint8_t kEnumUInt8 = 0x15;
-// The record count, the record's size field and its code word come before the enumeration part.
-constexpr size_t kEnumPartOffset = 8;
+constexpr size_t kEnumPartOffset = records::kPartOffset;
 // The item count is stored in 16 bits.
 constexpr uint32_t kMaxFlatItems = 0xFFFF;
 const BigEndianizer kBigEndian;
@@ -49,45 +49,12 @@ Items ItemsOf(const Handle& enumeration) {
   return items;
 }
 
-// The type string of one EnumUInt8 record that carries `enumPart`, then the flag byte 0 and the
-// list's one entry.
-Bytes RecordWith(const Bytes& enumPart) {
-  const size_t size = 4 + enumPart.size() + 1;
-  Bytes bytes = {0x00, 0x00, 0x00, 0x01, static_cast<uint8_t>(size >> 8), static_cast<uint8_t>(size),
-                 0x00, kEnumUInt8};
-  for (const uint8_t byte : enumPart) bytes.push_back(byte);
-  for (const uint8_t byte : {0x00, 0x00, 0x01, 0x00, 0x00}) bytes.push_back(byte);
-  return bytes;
-}
+// The type string of one record that carries `enumPart`, then the flag byte 0 and the list's one entry.
+Bytes RecordWith(const Bytes& enumPart) { return records::OneRecordWith(kEnumUInt8, enumPart); }
 
-Bytes Saved(const TDR& type, int32_t* status = nullptr) {
-  const PersistTDData persist(kVersion);
-  UHandle h = nullptr;
-  const int32_t result = FlattenOneType(&persist, type, &h, &kBigEndian);
-  if (status != nullptr) *status = result;
-  else EXPECT_EQ(result, 0);
-  if (h == nullptr) return {};
-  Bytes bytes(*h, *h + DSGetHandleSize(h));
-  DSDisposeHandle(h);
-  return bytes;
-}
-
-struct Loaded {
-  int32_t status = -1;  // the reader's error, which the enumeration reader's failure becomes
-  TDR type;
-  size_t consumed = 0;
-};
-
-Loaded Load(const Bytes& bytes) {
-  const PersistTDData persist(kVersion);
-  InputBuf in(bytes.data(), bytes.size());
-  KoDataReader reader(&persist, &in, &kBigEndian, 0);
-  Loaded loaded;
-  loaded.type = reader.ReadTD();
-  loaded.status = reader.GetError();
-  loaded.consumed = reader.Position();
-  return loaded;
-}
+using records::Load;
+using records::Loaded;
+using records::Saved;
 
 TDREnum EnumOf(const TDR& type) { return vellum::As<TDRBasicNumeric>(type).GetEnum(); }
 

@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "support/TestSupport.h"
+#include "support/TypeStringRecords.h"
 #include "support/TypeSystemFixture.h"
 #include "runtime/BinData.h"
 #include "runtime/DSMemory.h"
@@ -22,13 +23,12 @@
 
 namespace {
 
-using Bytes = std::vector<uint8_t>;
+using records::Bytes;
 using Powers = std::vector<std::pair<TDBaseUnits, int16_t>>;
 
-constexpr uint32_t kVersion = 0x22308000;
+using records::kVersion;
 constexpr uint8_t kFloat64WithUnits = 0x1A;
-// The record count, the record's size field and its code word come before the units part.
-constexpr size_t kUnitsPartOffset = 8;
+constexpr size_t kUnitsPartOffset = records::kPartOffset;
 const BigEndianizer kBigEndian;
 
 class TDUnitsTest : public TypeSystemTest {};
@@ -50,43 +50,12 @@ Powers PowersOf(const Handle& units) {
   return powers;
 }
 
-// The type string of one Float64 record that carries `unitsPart`, then the flag byte 0 and the
-// list's one entry.
-Bytes RecordWith(const Bytes& unitsPart) {
-  const size_t size = 4 + unitsPart.size() + 1;
-  Bytes bytes = {0x00, 0x00, 0x00, 0x01, static_cast<uint8_t>(size >> 8), static_cast<uint8_t>(size),
-                 0x00, kFloat64WithUnits};
-  for (const uint8_t byte : unitsPart) bytes.push_back(byte);
-  for (const uint8_t byte : {0x00, 0x00, 0x01, 0x00, 0x00}) bytes.push_back(byte);
-  return bytes;
-}
+// The type string of one record that carries `unitsPart`, then the flag byte 0 and the list's one entry.
+Bytes RecordWith(const Bytes& unitsPart) { return records::OneRecordWith(kFloat64WithUnits, unitsPart); }
 
-Bytes Saved(const TDR& type) {
-  const PersistTDData persist(kVersion);
-  UHandle h = nullptr;
-  EXPECT_EQ(FlattenOneType(&persist, type, &h, &kBigEndian), 0);
-  if (h == nullptr) return {};
-  Bytes bytes(*h, *h + DSGetHandleSize(h));
-  DSDisposeHandle(h);
-  return bytes;
-}
-
-struct Loaded {
-  int32_t status = -1;  // the reader's error, which the units reader's failure becomes
-  TDR type;
-  size_t consumed = 0;
-};
-
-Loaded Load(const Bytes& bytes) {
-  const PersistTDData persist(kVersion);
-  InputBuf in(bytes.data(), bytes.size());
-  KoDataReader reader(&persist, &in, &kBigEndian, 0);
-  Loaded loaded;
-  loaded.type = reader.ReadTD();
-  loaded.status = reader.GetError();
-  loaded.consumed = reader.Position();
-  return loaded;
-}
+using records::Load;
+using records::Loaded;
+using records::Saved;
 
 TDRUnits UnitsOf(const TDR& type) { return vellum::As<TDRNumeric>(type).GetUnits(); }
 
