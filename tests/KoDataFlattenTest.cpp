@@ -17,6 +17,7 @@
 #include "runtime/HandleAllocation.h"
 #include "runtime/PXApp.h"
 #include "runtime/PXNumbers.h"
+#include "runtime/MoveBytes.h"
 #include "runtime/PXStrings.h"
 #include "vellum/DataStreams.h"
 #include "vellum.h"
@@ -34,17 +35,10 @@ std::string Flatten(const TDR& type, const void* data, uint32_t version = PXApp:
   return HexBytes(out.Data(), out.GetBytesWritten());
 }
 
-// Reads `hex` into `datum`; the status, and every byte must be consumed on success.
+// Reads `hex` into `data`, which must take every byte.
 int32_t Unflatten(const TDR& type, const std::string& hex, void* data,
                   uint32_t version = PXApp::Instance().GetVersion()) {
-  const std::vector<uint8_t> bytes = BytesFromHex(hex);
-  InputBuf in(bytes.data(), bytes.size());
-  KoDataReader reader(&in, version, nullptr, nullptr, 0);
-  const int32_t status = reader.ReadData(type, data, 1);
-  if (status == kStatusNoError) {
-    EXPECT_EQ(reader.BytesLeft(), 0u) << hex;
-  }
-  return status;
+  return vellum::UnflattenData(type, BytesFromHex(hex), data, version);
 }
 
 std::string Text(LStrHandle h) {
@@ -62,27 +56,27 @@ TEST_F(KoDataFlattenTest, GoldenValues) {
   EXPECT_EQ(Flatten(GetBoolTD(), &yes), "01");
   EXPECT_EQ(Flatten(GetBoolTD(), &yes, 0x04502003), "80 00");
 
-  Datum empty(GetStringTD(), DatumStart::kDefault);
+  vellum::Value empty(GetStringTD());
   EXPECT_EQ(Flatten(GetStringTD(), empty.Data()), "00 00 00 00");
-  Datum abc(GetStringTD(), DatumStart::kDefault);
+  vellum::Value abc(GetStringTD());
   LStrHandle text = nullptr;
   ASSERT_EQ(StringUtils::ToLStr("abc", &text), kStatusNoError);
-  abc.Put(0, text);
+  Store(abc.Data(), text);
   EXPECT_EQ(Flatten(GetStringTD(), abc.Data()), "00 00 00 03 61 62 63");
 
   const TDR shorts = TDRArray(1, GetiW());
-  Datum none(shorts, DatumStart::kDefault);
+  vellum::Value none(shorts);
   EXPECT_EQ(Flatten(shorts, none.Data()), "00 00 00 00");
-  Datum two(shorts, DatumStart::kDefault);
+  vellum::Value two(shorts);
   ASSERT_EQ(Unflatten(shorts, "00 00 00 02 00 01 00 02", two.Data()), kStatusNoError);
   EXPECT_EQ(Flatten(shorts, two.Data()), "00 00 00 02 00 01 00 02");
 
   TDWCluster pair;
   pair << GetiB() << GetiL();
   const TDR cluster = pair.CheckIn();
-  Datum packed(cluster, DatumStart::kDefault);
-  packed.Put<int8_t>(0, -2);
-  packed.Put<int32_t>(vellum::As<TDRCluster>(cluster).GetEltOffset(1), 0x01020304);
+  vellum::Value packed(cluster);
+  Store(packed.Data(), int8_t{-2});
+  Store(static_cast<uint8_t*>(packed.Data()) + vellum::As<TDRCluster>(cluster).GetEltOffset(1), int32_t{0x01020304});
   EXPECT_EQ(Flatten(cluster, packed.Data()), "FE 01 02 03 04");
 }
 
@@ -132,18 +126,18 @@ TEST_F(KoDataFlattenTest, ExtendedValuesTakeSixteenBytesAndKeepEveryBit) {
 
 TEST_F(KoDataFlattenTest, StringsFollowTheirBound) {
   const TDR bounded = TDRString(nullptr, 2);
-  Datum two(bounded, DatumStart::kDefault);
+  vellum::Value two(bounded);
   ASSERT_EQ(Unflatten(bounded, "00 00 00 03 61 62 63", two.Data()), kStatusNoError);
-  EXPECT_EQ(Text(two.Get<LStrHandle>()), "ab");
+  EXPECT_EQ(Text(Load<LStrHandle>(two.Data())), "ab");
   const TDR fixed = TDRString(nullptr, vellum::bound::Fixed(5));
-  Datum five(fixed, DatumStart::kDefault);
+  vellum::Value five(fixed);
   ASSERT_EQ(Unflatten(fixed, "00 00 00 03 61 62 63", five.Data()), kStatusNoError);
-  EXPECT_EQ(Text(five.Get<LStrHandle>()), std::string("abc\0\0", 5));
+  EXPECT_EQ(Text(Load<LStrHandle>(five.Data())), std::string("abc\0\0", 5));
   // A length far beyond the input is refused before anything is allocated.
-  Datum big(GetStringTD(), DatumStart::kDefault);
+  vellum::Value big(GetStringTD());
   LiveBlockCheck blocks;
   EXPECT_EQ(Unflatten(GetStringTD(), "00 30 00 00 61 62", big.Data()), kStatusImplausibleData);
-  EXPECT_EQ(big.Get<LStrHandle>(), nullptr);
+  EXPECT_EQ(Load<LStrHandle>(big.Data()), nullptr);
   EXPECT_EQ(Unflatten(GetStringTD(), "FF FF FF FF", big.Data()), kStatusImplausibleData);
 }
 
@@ -151,17 +145,17 @@ TEST_F(KoDataFlattenTest, ArraysAreRefusedWhenTheirElementsCannotBeInTheInput) {
   const TDR doubles = TDRArray(1, GetfD());
   const TDR pointers = TDRArray(1, TDRPtr());
   const TDR square = TDRArray(2, GetiB());
-  Datum value(doubles, DatumStart::kDefault);
+  vellum::Value value(doubles);
   LiveBlockCheck blocks;
   DebugCapture capture;
   EXPECT_EQ(Unflatten(doubles, "00 01 FF FF 00 00", value.Data()), kStatusImplausibleData);
-  EXPECT_EQ(value.Get<UHandle>(), nullptr);
+  EXPECT_EQ(Load<UHandle>(value.Data()), nullptr);
   // Elements that flatten to nothing are bounded by what a read may allocate.
-  Datum many(pointers, DatumStart::kDefault);
+  vellum::Value many(pointers);
   EXPECT_EQ(Unflatten(pointers, "01 00 00 00", many.Data()), kStatusImplausibleData);
   ASSERT_EQ(Unflatten(pointers, "00 00 10 00", many.Data()), kStatusNoError);
   // 64-bit products that overflow are refused.
-  Datum grid(square, DatumStart::kDefault);
+  vellum::Value grid(square);
   EXPECT_EQ(Unflatten(square, "7F FF FF FF 7F FF FF FF", grid.Data()), kStatusImplausibleData);
 }
 
@@ -169,13 +163,13 @@ TEST_F(KoDataFlattenTest, BoundedAndFixedArraysStayInTheirBlocks) {
   TDWArray bounded(0, GetiW());
   EXPECT_EQ(bounded.AddDim(2, 0), kStatusNoError);
   const TDR type = bounded.CheckIn();
-  Datum value(type, DatumStart::kDefault);
+  vellum::Value value(type);
   ASSERT_EQ(Unflatten(type, "00 00 00 03 00 01 00 02 00 03", value.Data()), kStatusNoError);
   EXPECT_EQ(Flatten(type, value.Data()), "00 00 00 02 00 01 00 02");
   TDWArray fixed(0, GetiW());
   EXPECT_EQ(fixed.AddDim(vellum::bound::Fixed(3), 0), kStatusNoError);
   const TDR fixedType = fixed.CheckIn();
-  Datum three(fixedType, DatumStart::kDefault);
+  vellum::Value three(fixedType);
   DebugCapture capture;
   ASSERT_EQ(Unflatten(fixedType, "00 00 00 02 00 07 00 08", three.Data()), kStatusNoError);
   EXPECT_TRUE(capture.Contains("fixed size array prealloc'd wrong?"));
@@ -184,10 +178,10 @@ TEST_F(KoDataFlattenTest, BoundedAndFixedArraysStayInTheirBlocks) {
 
 TEST_F(KoDataFlattenTest, OldBooleansArePackedSixteenToAWord) {
   const TDR flags = TDRArray(1, GetBoolTD());
-  Datum value(flags, DatumStart::kDefault);
+  vellum::Value value(flags);
   ASSERT_EQ(Unflatten(flags, "00 00 00 03 01 00 01", value.Data()), kStatusNoError);
   EXPECT_EQ(Flatten(flags, value.Data(), 0x04502003), "00 00 00 03 A0 00");
-  Datum back(flags, DatumStart::kDefault);
+  vellum::Value back(flags);
   ASSERT_EQ(Unflatten(flags, "00 00 00 03 A0 00", back.Data(), 0x04502003), kStatusNoError);
   EXPECT_EQ(Flatten(flags, back.Data()), "00 00 00 03 01 00 01");
 }
@@ -220,12 +214,12 @@ TEST_F(KoDataFlattenTest, EveryPrefixOfEveryGoldenValueFailsCleanly) {
     SCOPED_TRACE(hex);
     const int64_t before = DSLiveBlockCount();
     {
-      Datum whole(type, DatumStart::kDefault);
+      vellum::Value whole(type);
       ASSERT_EQ(Unflatten(type, hex, whole.Data()), kStatusNoError);
       const std::vector<uint8_t> bytes = BytesFromHex(hex);
       for (size_t n = 0; n < bytes.size(); ++n) {
         SCOPED_TRACE(n);
-        Datum partial(type, DatumStart::kDefault);
+        vellum::Value partial(type);
         InputBuf in(bytes.data(), n);
         KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
         // Input that ends early (74), or a length the input left cannot hold (116).
@@ -244,11 +238,11 @@ TEST_F(KoDataFlattenTest, ValidLongValuesAreNeverRefused) {
   bytes[1] = 0x30;
   bytes[2] = 0x00;
   bytes[3] = 0x00;
-  Datum text(GetStringTD(), DatumStart::kDefault);
+  vellum::Value text(GetStringTD());
   InputBuf in(bytes.data(), bytes.size());
   KoDataReader reader(&in, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
   ASSERT_EQ(reader.ReadData(GetStringTD(), text.Data(), 1), kStatusNoError);
-  EXPECT_EQ((*text.Get<LStrHandle>())->cnt, 3 << 20);
+  EXPECT_EQ((*Load<LStrHandle>(text.Data()))->cnt, 3 << 20);
   // A million Int8 elements with their bytes.
   const TDR bytesType = TDRArray(1, GetiB());
   std::vector<uint8_t> array(4 + 1000000, 7);
@@ -256,7 +250,7 @@ TEST_F(KoDataFlattenTest, ValidLongValuesAreNeverRefused) {
   array[1] = 0x0F;
   array[2] = 0x42;
   array[3] = 0x40;
-  Datum million(bytesType, DatumStart::kDefault);
+  vellum::Value million(bytesType);
   InputBuf arrayIn(array.data(), array.size());
   KoDataReader arrayReader(&arrayIn, PXApp::Instance().GetVersion(), nullptr, nullptr, 0);
   EXPECT_EQ(arrayReader.ReadData(bytesType, million.Data(), 1), kStatusNoError);
@@ -282,11 +276,11 @@ TEST_F(KoDataFlattenTest, RandomValuesReadBackEqualAndWriteTheSameBytes) {
     ASSERT_TRUE(type);
     const int64_t before = DSLiveBlockCount();
     {
-      Datum value(type, DatumStart::kDefault);
-      random.Fill(type, value.Data());
+      vellum::Value value(type);
+      random.Fill(type, static_cast<uint8_t*>(value.Data()));
       const std::string flat = Flatten(type, value.Data());
       ASSERT_EQ(flat.find("status"), std::string::npos) << flat;
-      Datum back(type, DatumStart::kDefault);
+      vellum::Value back(type);
       ASSERT_EQ(Unflatten(type, flat, back.Data()), kStatusNoError) << flat;
       EXPECT_EQ(CompareDataTDR(type, value.Data(), back.Data(), 0, 0), 0) << flat;
       EXPECT_EQ(Flatten(type, back.Data()), flat);
@@ -311,7 +305,7 @@ TEST_F(KoDataFlattenTest, AllocationFailuresDuringAReadLeaveNoLeak) {
     int32_t status = 0;
     bool fired = false;
     {
-      Datum value(type, DatumStart::kDefault);
+      vellum::Value value(type);
       ScopedAllocationFailure failure(nth);
       status = Unflatten(type, flat, value.Data());
       fired = failure.Fired();

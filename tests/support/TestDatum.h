@@ -1,5 +1,6 @@
-// One datum of a type in aligned storage the test owns, its handles given back when it goes, and
-// the hexadecimal byte strings that golden tests compare.
+// Zeroed, aligned storage for one datum of a type, for tests of what fills it (default data,
+// copies, conversion), its handles given back when it goes; and the hexadecimal byte strings that
+// golden tests compare. A datum that starts as the type's default value is a vellum::Value.
 #pragma once
 
 #include <gtest/gtest.h>
@@ -14,17 +15,9 @@
 #include "runtime/PXStrings.h"
 #include "vellum.h"
 
-// Whether a Datum starts as the type's default value or as zero bytes.
-enum class DatumStart { kZeroed, kDefault };
-
 class Datum {
  public:
-  explicit Datum(const TD& type, DatumStart start = DatumStart::kZeroed)
-      : type_(type), bytes_((static_cast<size_t>(type.DataSize()) + 15) / 8 + 1, 0) {
-    if (start == DatumStart::kDefault) {
-      EXPECT_EQ(type_.InflateDefData(Data(), 0, 1, 0), 0);
-    }
-  }
+  explicit Datum(const TD& type) : type_(type), bytes_((static_cast<size_t>(type.DataSize()) + 15) / 8 + 1, 0) {}
   ~Datum() { type_.DeflateData(Data(), Data() + bytes_.size() * sizeof(uint64_t), 1, NormalHandleAllocator()); }
   Datum(const Datum&) = delete;
   Datum& operator=(const Datum&) = delete;
