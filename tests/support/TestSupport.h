@@ -5,6 +5,8 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <initializer_list>
+#include <utility>
 #include <cstdint>
 #include <memory>
 #include <mutex>
@@ -83,10 +85,14 @@ inline uint32_t DictionarySize(std::string_view name) {
   return 0;
 }
 
-// Fails the 1st, 2nd, ... allocation of `operation` until it succeeds. Each failure must give
-// `expected` and leave nothing allocated; the run that succeeds must give 0.
-template <class Operation>
-void SweepAllocationFailures(int32_t expected, Operation&& operation) {
+// Fails the 1st, 2nd, ... allocation of `operation` until it succeeds: the one sweep every test
+// of running out of memory uses. Each failed run must return one of `failures` and leave no
+// block behind; `afterFailure` (optional) then checks that the caller's data is intact. The run
+// that succeeds must return 0. `operation` makes what it changes afresh each run, or changes
+// only what a failure leaves as it was.
+template <class Operation, class AfterFailure>
+void SweepAllocationFailures(std::initializer_list<int32_t> failures, Operation&& operation,
+                             AfterFailure&& afterFailure) {
   for (int64_t nth = 1;; ++nth) {
     SCOPED_TRACE(nth);
     ASSERT_LT(nth, 1000) << "never succeeded";
@@ -103,6 +109,12 @@ void SweepAllocationFailures(int32_t expected, Operation&& operation) {
       EXPECT_GT(nth, 1) << "the operation allocated nothing that could fail";
       return;
     }
-    EXPECT_EQ(status, expected);
+    EXPECT_NE(std::find(failures.begin(), failures.end(), status), failures.end()) << "status " << status;
+    afterFailure();
   }
+}
+
+template <class Operation>
+void SweepAllocationFailures(int32_t expected, Operation&& operation) {
+  SweepAllocationFailures({expected}, std::forward<Operation>(operation), [] {});
 }
